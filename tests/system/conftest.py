@@ -1,0 +1,88 @@
+"""Fixtures of the system tests: a world for each test and the daemon in it."""
+
+import sys
+from pathlib import Path
+
+import pytest
+
+sys.path.insert(0, str(Path(__file__).resolve().parents[1]))
+
+from world import World, kernel_has, missing  # noqa: E402
+from world.world import PROGRAM  # noqa: E402
+
+
+def pytest_configure(config):
+    config.addinivalue_line(
+        "markers", "needs_fs(name, …): skipped where the kernel cannot mount one of them")
+
+
+def pytest_report_header():
+    lacks = missing()
+    if lacks:
+        return ["no private world can be made here, every test will be skipped:",
+                *(f"  {text}" for text in lacks)]
+    absent = [name for name in ("ext2", "ext3", "ext4", "vfat", "exfat", "ntfs")
+              if not kernel_has(name)]
+    return [f"filesystems that this kernel cannot mount: {', '.join(absent) or 'none'}"]
+
+
+def pytest_runtest_setup(item):
+    for marker in item.iter_markers("needs_fs"):
+        absent = [name for name in marker.args if not kernel_has(name)]
+        if absent:
+            pytest.skip(f"the kernel cannot mount {', '.join(absent)}")
+
+
+@pytest.hookimpl(hookwrapper=True)
+def pytest_runtest_makereport(item):
+    """Put the worlds' state and the daemon's log beside a failed test."""
+    outcome = yield
+    report = outcome.get_result()
+    if report.failed and call_made_worlds(item):
+        for number, world in enumerate(item.stash[_WORLDS], 1):
+            report.sections.append((f"world {number}", world.diagnosis()))
+
+
+_WORLDS = pytest.StashKey[list]()
+
+
+def call_made_worlds(item):
+    return item.stash.get(_WORLDS, [])
+
+
+@pytest.fixture
+def make_world(request):
+    """Function that makes a World with given options; all are closed at the end."""
+    lacks = missing()
+    if lacks:
+        pytest.skip("no private world: " + "; ".join(lacks))
+    worlds = request.node.stash.setdefault(_WORLDS, [])
+
+    def make(**options):
+        world = World(**options)
+        worlds.append(world)
+        return world
+
+    yield make
+    while worlds:
+        worlds.pop().close()
+
+
+@pytest.fixture
+def world(make_world):
+    """A fresh world with the distribution's tools."""
+    return make_world()
+
+
+@pytest.fixture
+def start_daemon(world):
+    """Function that starts the daemon in `world`; skips where it is not built."""
+    if not world.program.exists():
+        pytest.skip(f"{world.program} is not built (default {PROGRAM})")
+    return world.start_daemon
+
+
+@pytest.fixture
+def daemon(start_daemon):
+    """The daemon, started in a world without disks, its start-up scan done."""
+    return start_daemon()

@@ -1,0 +1,161 @@
+"""The daemon as a process of a world: start, log, signals, end."""
+
+import os
+import signal
+import time
+from pathlib import Path
+
+from .waiting import WaitTimeout, wait_for
+
+STARTED = "have disk = "
+GONE_TAIL = 4000
+
+
+class DaemonGone(AssertionError):
+    """The daemon ended while a test was waiting for it."""
+
+
+class Daemon:
+    """One run of the daemon.
+
+    `process` is the nsenter that holds the daemon as its only child; the exit
+    status is the daemon's, negative for a signal.
+    """
+
+    def __init__(self, process, log_path):
+        self.process = process
+        self.log_path = Path(log_path)
+        self.outer_pid = wait_for(lambda: child_of(process.pid) or not self.running, 10,
+                                  "the daemon's process")
+
+    @property
+    def running(self):
+        return self.process.poll() is None
+
+    @property
+    def pid(self):
+        """The pid that the daemon itself sees."""
+        status = Path(f"/proc/{self.outer_pid}/status").read_text()
+        line = next(row for row in status.splitlines() if row.startswith("NSpid:"))
+        return int(line.split()[-1])
+
+    @property
+    def returncode(self):
+        """Exit status, None while it runs."""
+        return self.process.poll()
+
+    def log(self):
+        """All that it and its commands printed so far."""
+        return self.log_path.read_text(errors="replace")
+
+    def mark(self):
+        """A place in the log to read on from: `log_since(mark)`."""
+        return self.log_path.stat().st_size
+
+    def log_since(self, mark):
+        with self.log_path.open("rb") as stream:
+            stream.seek(mark)
+            return stream.read().decode(errors="replace")
+
+    def wait_log(self, text, timeout=30, since=0):
+        """Wait for a complete line that holds `text` at or after `since`; returns it.
+
+        Raises DaemonGone when the daemon ends without having printed it.
+        """
+        def look():
+            alive = self.running
+            for line in self.log_since(since).splitlines(keepends=True):
+                if text in line and (line.endswith("\n") or not alive):
+                    return line.rstrip("\n")
+            if not alive:
+                raise DaemonGone(f"ended with {self.returncode} before {text!r}; {self._tail()}")
+            return None
+        return wait_for(look, timeout, lambda: f"{text!r} in the log; {self._tail()}")
+
+    def wait_started(self, timeout=20):
+        """Wait until its signal handlers are in place and the first scan is done."""
+        return self.wait_log(STARTED, timeout)
+
+    def wait_idle_cycles(self, count=1, timeout=None):
+        """Wait for `count` further cycles that found no event (3 s each)."""
+        mark = self.mark()
+        wait_for(lambda: self._count("no event ...", mark) >= count or not self.running,
+                 timeout or 10 + 25 * count, f"{count} idle cycles")
+
+    def wait_rescan(self, timeout=60):
+        """Wait for the end of a rescan that begins after this call.
+
+        The rescan itself prints nothing when nothing changed; the consistency
+        check that follows it does.  The first one seen may have begun before.
+        """
+        mark = self.mark()
+        wait_for(lambda: self._count("mount dev num = ", mark) >= 4 or not self.running,
+                 timeout, "two rescans")
+
+    def wait_exit(self, timeout=30):
+        """Wait until it has ended; returns the exit status."""
+        wait_for(lambda: not self.running, timeout, lambda: f"the daemon's end; {self._tail()}")
+        return self.returncode
+
+    def signal(self, number):
+        """Send a signal to the daemon itself."""
+        if self.running:
+            os.kill(self.outer_pid, number)
+
+    def stop(self, timeout=60):
+        """Two SIGINTs and the end; returns the exit status.
+
+        While the daemon waits for a command the system library ignores SIGINT,
+        so one can be lost without a trace: each is sent until its line shows.
+        """
+        deadline = time.monotonic() + timeout
+        while self.running and time.monotonic() < deadline:
+            seen = self._count("get sig = SIGINT")
+            self.signal(signal.SIGINT)
+            self._wait_quietly(lambda: self._count("get sig = SIGINT") > seen, 1)
+            if self._count("get sig = SIGINT") >= 2:
+                self._wait_quietly(lambda: False, max(0.1, deadline - time.monotonic()))
+        return self.wait_exit(0.1)
+
+    def kill(self):
+        """End it without a chance to tidy up."""
+        self.signal(signal.SIGKILL)
+        return self.wait_exit(10)
+
+    def rss_kib(self):
+        return self._rollup("Rss:")
+
+    def pss_kib(self):
+        return self._rollup("Pss:")
+
+    def fds(self):
+        """What its open descriptors point to."""
+        folder = f"/proc/{self.outer_pid}/fd"
+        return {int(name): os.readlink(f"{folder}/{name}") for name in os.listdir(folder)}
+
+    def _rollup(self, key):
+        for line in Path(f"/proc/{self.outer_pid}/smaps_rollup").read_text().splitlines():
+            if line.startswith(key):
+                return int(line.split()[1])
+        raise KeyError(key)
+
+    def _count(self, text, since=0):
+        return self.log_since(since).count(text)
+
+    def _wait_quietly(self, condition, timeout):
+        try:
+            wait_for(lambda: condition() or not self.running, timeout, "")
+        except WaitTimeout:
+            pass
+
+    def _tail(self):
+        return f"the log ends:\n{self.log()[-GONE_TAIL:]}"
+
+
+def child_of(pid):
+    """The only child of a process, 0 while there is none."""
+    try:
+        children = Path(f"/proc/{pid}/task/{pid}/children").read_text().split()
+    except FileNotFoundError:
+        return 0
+    return int(children[0]) if children else 0
