@@ -1,0 +1,182 @@
+#include "fs/fs_probe.h"
+
+#include <unistd.h>
+
+#include <cstring>
+
+#include "log/log.h"
+
+namespace {
+
+constexpr int SECTOR_SIZE = 512;
+constexpr int SUPERBLOCK_OFFSET = 1024;  // of ext and HFS+
+constexpr int EXT_SUPERBLOCK_SIZE = 1024;
+
+constexpr size_t OEM_ID_OFFSET = 3;
+constexpr char NTFS_OEM_ID[] = "NTFS    ";
+constexpr char EXFAT_OEM_ID[] = "EXFAT";
+constexpr char EFI_SIGNATURE[] = "EFI PART";
+
+constexpr size_t BOOT_SIGNATURE_OFFSET = 510;
+
+constexpr size_t EXT_MAGIC_OFFSET = 0x38;
+constexpr size_t EXT_COMPAT_OFFSET = 0x5C;
+constexpr size_t EXT_INCOMPAT_OFFSET = 0x60;
+constexpr size_t EXT_RO_COMPAT_OFFSET = 0x64;
+constexpr uint16_t EXT_MAGIC = 0xEF53;
+constexpr uint8_t EXT_HAS_JOURNAL = 0x4;
+constexpr uint32_t EXT4_FIRST_INCOMPAT = 0x40;  // extents; later features are larger
+constexpr uint32_t EXT4_FIRST_RO_COMPAT = 8;    // huge files; later features are larger
+
+constexpr size_t HFSPLUS_ATTRIBUTES_OFFSET = 6;
+constexpr uint8_t HFSPLUS_JOURNALED = 0x20;
+
+// A region of the device with the zero byte behind that fs_read_at wants.
+template <int Length>
+struct region {
+    uint8_t bytes[Length + 1]{};
+
+    bool read(int fd, int offset) { return fs_read_at(fd, bytes, offset, Length) == 0; }
+    bool holds(size_t offset, const char* text) const
+    {
+        return memcmp(bytes + offset, text, strlen(text)) == 0;
+    }
+};
+
+using sector = region<SECTOR_SIZE>;
+
+uint16_t little_endian_16(const uint8_t* bytes)
+{
+    return static_cast<uint16_t>(bytes[0] | bytes[1] << 8);
+}
+
+uint32_t little_endian_32(const uint8_t* bytes)
+{
+    return little_endian_16(bytes) | static_cast<uint32_t>(little_endian_16(bytes + 2)) << 16;
+}
+
+// A jump over the parameter block, as every FAT boot sector begins.
+bool begins_with_jump(const sector& boot)
+{
+    const bool short_jump = boot.bytes[0] == 0xEB && boot.bytes[2] == 0x90;
+    return short_jump || boot.bytes[0] == 0xE9;
+}
+
+bool has_boot_signature(const sector& boot)
+{
+    return boot.bytes[BOOT_SIGNATURE_OFFSET] == 0x55 &&
+           boot.bytes[BOOT_SIGNATURE_OFFSET + 1] == 0xAA;
+}
+
+int32_t classify_ext(const uint8_t* superblock)
+{
+    if ((superblock[EXT_COMPAT_OFFSET] & EXT_HAS_JOURNAL) == 0) {
+        return FS_EXT2;
+    }
+    if (little_endian_32(superblock + EXT_INCOMPAT_OFFSET) >= EXT4_FIRST_INCOMPAT) {
+        return FS_EXT4;
+    }
+    if (little_endian_32(superblock + EXT_RO_COMPAT_OFFSET) >= EXT4_FIRST_RO_COMPAT) {
+        return FS_EXT4;
+    }
+    return FS_EXT3;
+}
+
+// exFAT also looks like FAT, and a GPT disk's first sector like an extended boot record: the order
+// decides what such a device is.
+constexpr int32_t (*PROBES[])(int) = {
+    fs_probe_ntfs,    fs_probe_exfat,    fs_probe_fat, fs_probe_ext,
+    fs_probe_hfsplus, fs_probe_extended, fs_probe_efi, fs_probe_mbr,
+};
+
+}  // namespace
+
+int fs_read_at(int fd, void* buffer, int offset, int length)
+{
+    if (lseek(fd, offset, SEEK_SET) != offset) {
+        log_errno("seek err!\n");
+        return -1;
+    }
+    if (read(fd, buffer, static_cast<size_t>(length)) != length) {
+        log_errno("read err! b = %s, len = %d\n", static_cast<const char*>(buffer), length);
+        return -1;
+    }
+    return 0;
+}
+
+int32_t fs_probe_ntfs(int fd)
+{
+    sector boot;
+    return boot.read(fd, 0) && boot.holds(OEM_ID_OFFSET, NTFS_OEM_ID) ? FS_NTFS : FS_NONE;
+}
+
+int32_t fs_probe_exfat(int fd)
+{
+    sector boot;
+    return boot.read(fd, 0) && boot.holds(OEM_ID_OFFSET, EXFAT_OEM_ID) ? FS_EXFAT : FS_NONE;
+}
+
+int32_t fs_probe_fat(int fd)
+{
+    sector boot;
+    if (!boot.read(fd, 0) || !begins_with_jump(boot)) {
+        return FS_NONE;
+    }
+    // Sticks are about that lack the second signature byte, so only the first is asked for.
+    const bool signed_boot = boot.bytes[BOOT_SIGNATURE_OFFSET] == 0x55;
+    return signed_boot && !boot.holds(OEM_ID_OFFSET, NTFS_OEM_ID) ? FS_FAT : FS_NONE;
+}
+
+int32_t fs_probe_ext(int fd)
+{
+    region<EXT_SUPERBLOCK_SIZE> superblock;
+    if (!superblock.read(fd, SUPERBLOCK_OFFSET)) {
+        return FS_NONE;
+    }
+    if (little_endian_16(superblock.bytes + EXT_MAGIC_OFFSET) != EXT_MAGIC) {
+        return FS_NONE;
+    }
+    return classify_ext(superblock.bytes);
+}
+
+int32_t fs_probe_hfsplus(int fd)
+{
+    sector header;
+    if (!header.read(fd, SUPERBLOCK_OFFSET)) {
+        return FS_NONE;
+    }
+    const bool journaled = (header.bytes[HFSPLUS_ATTRIBUTES_OFFSET] & HFSPLUS_JOURNALED) != 0;
+    return !journaled && header.holds(0, "H+") ? FS_HFSPLUS : FS_NONE;
+}
+
+int32_t fs_probe_extended(int fd)
+{
+    sector boot;
+    if (!boot.read(fd, 0)) {
+        return FS_NONE;
+    }
+    return has_boot_signature(boot) && !begins_with_jump(boot) ? FS_EXTENDED : FS_NONE;
+}
+
+int32_t fs_probe_efi(int fd)
+{
+    sector header;
+    return header.read(fd, SECTOR_SIZE) && header.holds(0, EFI_SIGNATURE) ? FS_EFI : FS_NONE;
+}
+
+int32_t fs_probe_mbr(int fd)
+{
+    sector boot;
+    return boot.read(fd, 0) && has_boot_signature(boot) ? FS_MBR : FS_NONE;
+}
+
+int32_t fs_probe_all(int fd)
+{
+    for (const auto probe : PROBES) {
+        const int32_t fs_type = probe(fd);
+        if (fs_type != FS_NONE) {
+            return fs_type;
+        }
+    }
+    return FS_NONE;
+}

@@ -1,0 +1,144 @@
+#include "fs/fs_type.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "fs/fs_probe.h"
+#include "log/log.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t DEV_PATH_SIZE = 64;
+constexpr size_t TYPE_PREFIX_LENGTH = 4;
+constexpr char TYPE_KEY[] = "TYPE=";
+constexpr char RULE[] = "==========================\n";
+
+struct blkid_type {
+    const char* prefix;
+    fs_code code;
+};
+
+// Four characters decide, so that ntfs3 and ext4dev count as what they are.
+constexpr blkid_type BLKID_TYPES[] = {
+    {"vfat", FS_FAT},  {"ntfs", FS_NTFS}, {"ext2", FS_EXT2},
+    {"ext3", FS_EXT3}, {"ext4", FS_EXT4}, {"exfa", FS_EXFAT},
+};
+
+int32_t code_of_blkid_type(const char* type)
+{
+    for (const blkid_type& entry : BLKID_TYPES) {
+        if (strncmp(type, entry.prefix, TYPE_PREFIX_LENGTH) == 0) {
+            return entry.code;
+        }
+    }
+    return FS_NONE;
+}
+
+bool is_ext(int32_t fs_type)
+{
+    return fs_type == FS_EXT2 || fs_type == FS_EXT3 || fs_type == FS_EXT4;
+}
+
+void log_heading(const char* dev_path)
+{
+    log_info("%s", RULE);
+    log_info("check dev fs, dev = %s\n", dev_path);
+    log_info("%s", RULE);
+}
+
+}  // namespace
+
+const char* const fs_type_names[FS_CODE_COUNT] = {
+    "ERR FS",  "ERR FS", "MBR",  "EXT2",     "EXT3",  "FAT",
+    "HFSPLUS", "EFI",    "NTFS", "EXTENDED", "EXFAT", "EXT4",
+};
+
+const char* fs_type_name(int32_t fs_type)
+{
+    const bool known = fs_type >= 0 && fs_type < FS_CODE_COUNT;
+    return fs_type_names[known ? fs_type : FS_NONE];
+}
+
+int32_t fs_detect_type(const char* dev_path)
+{
+    log_heading(dev_path);
+    const int fd = open(dev_path, O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+        perror("open device err!\n");
+        log_info("err, open dev = %s\n", dev_path);
+        return FS_NONE;
+    }
+    int32_t fs_type = fs_probe_all(fd);
+    close(fd);
+
+    // The ext superblock only tells that blkid is to be asked which member of the family it is.
+    const bool ask_blkid = fs_type == FS_NONE || is_ext(fs_type);
+    if (ask_blkid) {
+        fs_type = fs_type_from_blkid(dev_path);
+    }
+    log_info("===> dev type = %d\n", fs_type);
+    fs_type_hook(fs_type, dev_path);
+    if (fs_type == FS_NONE) {
+        log_info("check fs, dev = %s, fs = FS_NONE\n", dev_path);
+    } else {
+        log_info("check fs, dev = %s, fs = %s\n", dev_path, fs_type_name(fs_type));
+    }
+    return fs_type;
+}
+
+int32_t fs_type_from_blkid(const char* dev_path)
+{
+    char type[FS_TYPE_TEXT_SIZE]{};
+    if (fs_blkid_type(dev_path, type, sizeof(type)) != 0) {
+        return FS_NONE;
+    }
+    const int32_t fs_type = code_of_blkid_type(type);
+    fs_type_hook(fs_type, dev_path);
+    return fs_type;
+}
+
+int fs_blkid_type(const char* dev_path, char* out, size_t size)
+{
+    char command[COMMAND_SIZE];
+    text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_BLKID_TYPE);
+    exec_cmd(command, 1);
+
+    char* text = file_read_all(SCRATCH_BLKID_TYPE);
+    if (text == nullptr) {
+        return 1;
+    }
+    // The first match wins, also inside PTTYPE or SEC_TYPE.
+    const char* match = strstr(text, TYPE_KEY);
+    if (match != nullptr) {
+        const size_t key_length = strlen(TYPE_KEY);
+        const char* value = strlen(match) > key_length ? match + key_length + 1 : "";
+        text_copy_n(out, size, value, strcspn(value, "\""));
+        log_info("dev = %s, get type = %s\n", dev_path, out);
+    }
+    free(text);
+    file_delete(SCRATCH_BLKID_TYPE);
+    return match != nullptr ? 0 : 1;
+}
+
+int dev_has_fs_type(const char* dev_name)
+{
+    char dev_path[DEV_PATH_SIZE];
+    path_dev_node(dev_path, sizeof(dev_path), dev_name);
+    char type[FS_TYPE_TEXT_SIZE]{};
+    return fs_blkid_type(dev_path, type, sizeof(type)) == 0 ? 1 : 0;
+}
+
+int fs_type_hook(int32_t fs_type, const char* dev_path)
+{
+    static_cast<void>(fs_type);
+    static_cast<void>(dev_path);
+    return 0;
+}

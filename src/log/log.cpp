@@ -1,0 +1,181 @@
+#include "log/log.h"
+
+#include <fcntl.h>
+#include <syslog.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdarg>
+#include <cstdio>
+#include <cstring>
+#include <ctime>
+
+namespace {
+
+constexpr size_t HEADER_SIZE = 256;
+constexpr size_t MESSAGE_SIZE = 512;
+constexpr size_t LOG_PATH_SIZE = 128;
+constexpr int32_t LOG_LINES_MAX = 1500;
+
+uint8_t log_debug = 1;
+volatile uint8_t log_syslog = 0;
+FILE* log_fp = nullptr;
+int32_t log_lines = 0;
+
+const char* base_name(const char* file)
+{
+    const char* slash = strrchr(file, '/');
+    return slash != nullptr ? slash + 1 : file;
+}
+
+// Signals stay blocked while a message goes out: the handler logs too, and neither stdio nor
+// syslog may be entered a second time from inside.
+struct signal_block {
+    sigset_t before;
+
+    signal_block()
+    {
+        sigset_t all;
+        sigfillset(&all);
+        sigprocmask(SIG_BLOCK, &all, &before);
+    }
+    ~signal_block() { sigprocmask(SIG_SETMASK, &before, nullptr); }
+    signal_block(const signal_block&) = delete;
+    signal_block& operator=(const signal_block&) = delete;
+};
+
+// A reader of our output that went away raises SIGPIPE on every line. Its handler would log, and
+// so raise the next one for ever; the signal that our own write caused is taken back instead.
+void discard_own_sigpipe()
+{
+    sigset_t pipe_only;
+    sigemptyset(&pipe_only);
+    sigaddset(&pipe_only, SIGPIPE);
+    const timespec no_wait{};
+    sigtimedwait(&pipe_only, nullptr, &no_wait);
+}
+
+void put_syslog(const char* text)
+{
+    openlog("tarndisk", 0, LOG_DAEMON);
+    syslog(LOG_INFO, "%s", text);
+    closelog();
+}
+
+// The header ends in the caller's format and so is a format itself.
+void build_header(char (&header)[HEADER_SIZE], int32_t level, const char* module, int32_t line,
+                  const char* fmt)
+{
+    switch (level) {
+        case LOG_LVL_WARN:
+            snprintf(header, HEADER_SIZE, "Warning[%s:%d]%s", module, line, fmt);
+            return;
+        case LOG_LVL_ERR:
+            snprintf(header, HEADER_SIZE, "ERROR[%s:%d]%s", module, line, fmt);
+            return;
+        case LOG_LVL_ERRNO:
+            snprintf(header, HEADER_SIZE, "ERROR[%s:%d](%s)%s", module, line, strerror(errno), fmt);
+            return;
+        default:
+            snprintf(header, HEADER_SIZE, "%s(%d)%s", module, line, fmt);
+            return;
+    }
+}
+
+}  // namespace
+
+void log_printf(int32_t level, const char* file, int32_t line, const char* fmt, ...)
+{
+    char header[HEADER_SIZE]{};
+    char message[MESSAGE_SIZE]{};
+    if (log_debug == 0) {
+        return;
+    }
+
+    const int saved_errno = errno;
+    build_header(header, level, base_name(file), line, fmt);
+
+    va_list args;
+    va_start(args, fmt);
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"
+    vsnprintf(message, sizeof(message), header, args);
+#pragma GCC diagnostic pop
+    va_end(args);
+
+    {
+        const signal_block quiet;
+        log_print_stdout("%s", message);
+        if (log_syslog != 0) {
+            put_syslog(message);
+        }
+    }
+    errno = saved_errno;
+}
+
+void log_print_stdout(const char* fmt, ...)
+{
+    const signal_block quiet;
+    va_list args;
+    va_start(args, fmt);
+    const bool failed = vprintf(fmt, args) < 0 || ferror(stdout) != 0;
+    va_end(args);
+    if (!failed) {
+        return;
+    }
+    if (errno == EPIPE) {
+        discard_own_sigpipe();
+    }
+    clearerr(stdout);
+}
+
+void log_set_debug()
+{
+    log_debug = 1;
+}
+
+void log_enable_syslog()
+{
+    log_syslog = 1;
+}
+
+int log_file_open()
+{
+    const time_t now = time(nullptr);
+    tm date{};
+    localtime_r(&now, &date);
+
+    char path[LOG_PATH_SIZE]{};
+    snprintf(path, sizeof(path), "/tmp/log/disk_log-%d-%d-%d-%d-%d-%d.txt", date.tm_year + 1900,
+             date.tm_mon + 1, date.tm_mday, date.tm_hour, date.tm_min, date.tm_sec);
+    log_fp = fopen(path, "at+");
+    if (log_fp == nullptr) {
+        printf("err, file = %s\n", path);
+        return 1;
+    }
+    // The services that this daemon starts must not keep its log file open.
+    fcntl(fileno(log_fp), F_SETFD, FD_CLOEXEC);
+    return 0;
+}
+
+int log_file_close()
+{
+    if (log_fp != nullptr) {
+        fclose(log_fp);
+    }
+    return 0;
+}
+
+int log_file_write(const char* text)
+{
+    if (log_fp == nullptr && log_file_open() != 0) {
+        return 1;
+    }
+    if (log_lines > LOG_LINES_MAX) {
+        return 1;
+    }
+    ++log_lines;
+    fwrite(text, 1, strlen(text), log_fp);
+    fflush(log_fp);
+    return 0;
+}

@@ -1,0 +1,11 @@
+// The one way a shell command is run.
+#pragma once
+
+// Runs command through the shell, waits for it and prints it on standard output first. attempts is
+// taken from 1 to 9, any other value means 5. 0 once the command ran to its end, whatever its exit
+// code; 1 when every attempt was killed by a signal or could not be started.
+int exec_cmd(const char* command, int attempts, const char* file = __builtin_FILE(),
+             int line = __builtin_LINE());
+
+// system() with the default SIGCHLD handling for its duration; the raw wait status.
+int run_system(const char* command);

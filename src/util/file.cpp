@@ -1,0 +1,402 @@
+#include "util/file.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include "log/log.h"
+#include "util/exec.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr int REMOVE_TRIES = 3;
+constexpr size_t SHELL_WORDS_SIZE = 32;  // room for the command's own words around a path
+constexpr mode_t PRIVATE_MODE = 0600;
+
+// A descriptor that closes itself.
+struct fd_guard {
+    int fd;
+
+    explicit fd_guard(int descriptor) : fd(descriptor) {}
+    ~fd_guard()
+    {
+        if (fd >= 0) {
+            close(fd);
+        }
+    }
+    fd_guard(const fd_guard&) = delete;
+    fd_guard& operator=(const fd_guard&) = delete;
+};
+
+int write_and_close(FILE* stream, const void* bytes, int32_t length)
+{
+    const int ret = stream_write_all(stream, bytes, length);
+    if (ret != 0) {
+        log_info("file write err, len = %d, ret = %d\n", length, ret);
+    }
+    fclose(stream);
+    return ret == 0 ? 0 : 1;
+}
+
+bool removed_in_tries(const char* path, int (*remove_call)(const char*))
+{
+    for (int i = 0; i < REMOVE_TRIES; ++i) {
+        if (remove_call(path) == 0) {
+            return true;
+        }
+    }
+    return false;
+}
+
+// Runs "<words around the path>" for a path of any length; no_memory tells a failed allocation.
+int exec_with_path(const char* before, const char* path, const char* after, bool* no_memory)
+{
+    const size_t size = strlen(path) + SHELL_WORDS_SIZE;
+    auto* command = static_cast<char*>(malloc(size));
+    *no_memory = command == nullptr;
+    if (command == nullptr) {
+        return 1;
+    }
+    text_format(command, size, "%s%s%s", before, path, after);
+    const int ret = exec_cmd(command, 1);
+    free(command);
+    return ret;
+}
+
+int remove_directory(const char* path)
+{
+    dir_stream dir(path);
+    if (dir.stream == nullptr || chdir(path) != 0) {
+        log_errno("ope dir err, path = %s\n", path);
+        return 1;
+    }
+    while (const char* name = dir.next_name()) {
+        // Hidden entries stay as well as "." and "..": what a user hid is not ours to delete.
+        if (name[0] != '.') {
+            path_remove_tree(name);
+        }
+    }
+    if (chdir("../") != 0) {
+        log_errno("ope dir err, path = %s\n", path);
+        return 1;
+    }
+    dir_remove_retry(path);
+    return 0;
+}
+
+}  // namespace
+
+dir_stream::dir_stream(const char* path) : stream(path != nullptr ? opendir(path) : nullptr) {}
+
+dir_stream::~dir_stream()
+{
+    if (stream != nullptr) {
+        closedir(stream);
+    }
+}
+
+const char* dir_stream::next_name()
+{
+    const dirent* entry = readdir(stream);
+    return entry != nullptr ? entry->d_name : nullptr;
+}
+
+bool path_exists(const char* path)
+{
+    return path != nullptr && access(path, F_OK) == 0;
+}
+
+int dir_has_entry(const char* path, const char* name)
+{
+    if (path == nullptr || name == nullptr) {
+        return 1;
+    }
+    dir_stream dir(path);
+    if (dir.stream == nullptr) {
+        log_err("open dir err, dir = %s\n", path);
+        return 1;
+    }
+    while (const char* entry = dir.next_name()) {
+        if (str_equal(entry, name) == 0) {
+            return 0;
+        }
+    }
+    return 1;
+}
+
+int64_t file_get_size(const char* path, uint8_t* exists)
+{
+    struct stat info {};
+    const bool found = stat(path, &info) == 0;
+    if (!found) {
+        log_errno("stat err, fn = %s\n", path);
+    }
+    if (exists != nullptr) {
+        *exists = found ? 1 : 0;
+    }
+    return found ? info.st_size : 0;
+}
+
+int stream_write_all(FILE* stream, const void* bytes, int32_t length)
+{
+    const auto* next = static_cast<const char*>(bytes);
+    int32_t left = length;
+    while (left > 0) {
+        const auto written =
+            static_cast<int32_t>(fwrite(next, 1, static_cast<size_t>(left), stream));
+        if (written < 0) {
+            log_warn("write err!\n");
+            return 1;
+        }
+        if (written == 0) {
+            return 0;
+        }
+        next += written;
+        left -= written;
+    }
+    return 0;
+}
+
+int file_write(const char* path, const void* bytes, int32_t length)
+{
+    if (path == nullptr || bytes == nullptr) {
+        return 1;
+    }
+    FILE* stream = fopen(path, "w");
+    if (stream == nullptr) {
+        log_info("file not exist, fn = %s\n", path);
+        return 1;
+    }
+    return write_and_close(stream, bytes, length);
+}
+
+int file_append(const char* path, const void* bytes, int32_t length)
+{
+    if (path == nullptr || bytes == nullptr) {
+        return 1;
+    }
+    FILE* stream = fopen(path, "at+");
+    if (stream == nullptr) {
+        log_err("open err, file = %s\n", path);
+        return 1;
+    }
+    return write_and_close(stream, bytes, length);
+}
+
+int fd_read_full(int fd, void* buffer, int32_t length)
+{
+    auto* next = static_cast<char*>(buffer);
+    int32_t left = length;
+    while (left > 0) {
+        const ssize_t got = read(fd, next, static_cast<size_t>(left));
+        if (got < 1) {
+            return 1;
+        }
+        next += got;
+        left -= static_cast<int32_t>(got);
+    }
+    return 0;
+}
+
+int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length)
+{
+    if (path == nullptr || buffer == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    const fd_guard file(open(path, O_RDWR | O_CREAT | O_SYNC | O_CLOEXEC, PRIVATE_MODE));
+    if (file.fd < 0) {
+        log_err("err!\n");
+        return 1;
+    }
+    if (offset > 0 && lseek(file.fd, offset, SEEK_SET) != offset) {
+        log_err("seek err!\n");
+        return 1;
+    }
+    const int ret = fd_read_full(file.fd, buffer, length);
+    if (ret != 0) {
+        log_err("read err, ret=%d, len=%d\n", ret, length);
+    }
+    return ret;
+}
+
+char* file_read_all(const char* path)
+{
+    if (path == nullptr) {
+        return nullptr;
+    }
+    if (!path_exists(path)) {
+        log_info("file not exist, file = %s\n", path);
+        return nullptr;
+    }
+    uint8_t exists = 0;
+    const int64_t size = file_get_size(path, &exists);
+    if (exists == 0) {
+        log_info("err, fn = %s, size = %d\n", path, static_cast<int>(size));
+        return nullptr;
+    }
+    if (size > FILE_READ_ALL_MAX) {
+        log_info("===== file too large =====\n");
+        return nullptr;
+    }
+    const fd_guard file(open(path, O_RDONLY | O_CLOEXEC));
+    if (file.fd < 0) {
+        log_info("open file err, file = %s\n", path);
+        return nullptr;
+    }
+    auto* content = static_cast<char*>(calloc(1, static_cast<size_t>(size) + 1));
+    if (content == nullptr) {
+        log_err("calloc err!\n");
+        return nullptr;
+    }
+    const int ret = fd_read_full(file.fd, content, static_cast<int32_t>(size));
+    if (ret != 0) {
+        log_err("err, fn = %s, ret = %d, file_size = %d\n", path, ret, static_cast<int>(size));
+        free(content);
+        return nullptr;
+    }
+    return content;
+}
+
+int file_read_buf(const char* path, void* buffer, int32_t size)
+{
+    if (path == nullptr || buffer == nullptr) {
+        return 1;
+    }
+    if (!path_exists(path)) {
+        log_info("file not exist, file = %s\n", path);
+        return 1;
+    }
+    memset(buffer, 0, static_cast<size_t>(size));
+    const fd_guard file(open(path, O_RDONLY | O_CLOEXEC));
+    if (file.fd < 0) {
+        log_info("open file err, file = %s\n", path);
+        return 1;
+    }
+    // A file shorter than the buffer is the ordinary case.
+    fd_read_full(file.fd, buffer, size);
+    return 0;
+}
+
+int file_delete(const char* path)
+{
+    if (path == nullptr) {
+        return 1;
+    }
+    if (!path_exists(path)) {
+        log_warn("del err! not exist file = %s\n", path);
+        return 1;
+    }
+    if (remove(path) != 0) {
+        log_errno("remove file err, file = %s\n", path);
+        return 1;
+    }
+    return 0;
+}
+
+int path_rm_rf(const char* path)
+{
+    if (path == nullptr) {
+        return 1;
+    }
+    bool no_memory = false;
+    if (exec_with_path("rm -rf \"", path, "\"", &no_memory) != 0) {
+        log_errno("rm err, fn = %s\n", path);
+        return 1;
+    }
+    return 0;
+}
+
+int file_remove_retry(const char* path)
+{
+    return removed_in_tries(path, remove) ? 0 : path_rm_rf(path);
+}
+
+int dir_remove_retry(const char* path)
+{
+    if (removed_in_tries(path, rmdir)) {
+        return 0;
+    }
+    log_errno("rm err, fn = %s\n", path);
+    return 1;
+}
+
+int link_remove_retry(const char* path)
+{
+    if (removed_in_tries(path, unlink)) {
+        return 0;
+    }
+    log_errno("rm err, fn = %s\n", path);
+    return 1;
+}
+
+int path_get_type(const char* path)
+{
+    if (path == nullptr) {
+        log_err("err!\n");
+        return -1;
+    }
+    struct stat info {};
+    if (lstat(path, &info) != 0) {
+        log_errno("file not exist, file = %s\n", path);
+        return -1;
+    }
+    if (S_ISDIR(info.st_mode)) {
+        return 1;
+    }
+    if (S_ISREG(info.st_mode)) {
+        return 2;
+    }
+    return S_ISLNK(info.st_mode) ? 3 : 0;
+}
+
+int dir_make(const char* path)
+{
+    if (path == nullptr) {
+        return 1;
+    }
+    if (path_exists(path)) {
+        return 0;
+    }
+    bool no_memory = false;
+    const int ret = exec_with_path("mkdir -p '", path, "'", &no_memory);
+    if (no_memory) {
+        log_err("err!\n");
+    }
+    return ret;
+}
+
+int path_remove_tree(const char* path)
+{
+    switch (path_get_type(path)) {
+        case 1:
+            return remove_directory(path);
+        case 2:
+            file_remove_retry(path);
+            return 0;
+        case 3:
+            link_remove_retry(path);
+            return 0;
+        default:
+            return 1;
+    }
+}
+
+int fifo_create_open(const char* path)
+{
+    if (!path_exists(path) && mknod(path, S_IFIFO | PRIVATE_MODE, 0) != 0) {
+        log_errno("mknod err:");
+        return -1;
+    }
+    // Not handed down: a service started by us would keep a pipe of an earlier run open.
+    const int fd = open(path, O_RDWR | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) {
+        log_errno("fopen err:");
+        return -1;
+    }
+    return fd;
+}

@@ -1,0 +1,80 @@
+// Small files, directories and pipes: whole-file readers and writers, removal, creation.
+// Results are 0 for success and 1 for failure unless a line says otherwise; every failure is
+// logged where it happens.
+#pragma once
+
+#include <dirent.h>
+
+#include <cstdint>
+#include <cstdio>
+
+// Largest file that file_read_all takes: a runaway scratch file must not exhaust a router's memory.
+constexpr int64_t FILE_READ_ALL_MAX = 0x7FFFFF;
+
+// An open directory that closes itself; stream is null when it could not be opened.
+struct dir_stream {
+    DIR* stream;
+
+    explicit dir_stream(const char* path);
+    ~dir_stream();
+    dir_stream(const dir_stream&) = delete;
+    dir_stream& operator=(const dir_stream&) = delete;
+
+    // The next entry's name, valid until the next call; null after the last.
+    const char* next_name();
+};
+
+// True when something exists at path.
+bool path_exists(const char* path);
+
+// 0 when the directory holds an entry of exactly that name, else 1.
+int dir_has_entry(const char* path, const char* name);
+
+// Size in bytes, 0 on failure; exists (may be null) becomes 1 on success and 0 on failure.
+int64_t file_get_size(const char* path, uint8_t* exists);
+
+// Writes length bytes. A stream that takes no more bytes ends the loop as a success.
+int stream_write_all(FILE* stream, const void* bytes, int32_t length);
+
+// Creates or truncates the file and writes length bytes.
+int file_write(const char* path, const void* bytes, int32_t length);
+
+// Appends length bytes, creating the file when it is missing.
+int file_append(const char* path, const void* bytes, int32_t length);
+
+// 0 when exactly length bytes were read, 1 when the data ended early.
+int fd_read_full(int fd, void* buffer, int32_t length);
+
+// Reads length bytes at offset. A missing file is created empty (mode 0600) and fails the read.
+int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length);
+
+// The whole content with a terminating zero, to be released with free(); null on failure.
+char* file_read_all(const char* path);
+
+// Zero-fills buffer and reads up to size bytes. A file of at least size bytes leaves no terminating
+// zero: callers that want text keep one zero byte behind the size they pass.
+int file_read_buf(const char* path, void* buffer, int32_t size);
+
+int file_delete(const char* path);
+
+// rm -rf of a path.
+int path_rm_rf(const char* path);
+
+// Up to 3 tries each without a pause; the first falls back to path_rm_rf.
+int file_remove_retry(const char* path);
+int dir_remove_retry(const char* path);
+int link_remove_retry(const char* path);
+
+// What lies at a path, links not followed: -1 error, 0 other, 1 directory, 2 file, 3 link.
+int path_get_type(const char* path);
+
+// mkdir -p; anything that exists at path counts as success. No single quote may stand in path.
+int dir_make(const char* path);
+
+// Removes a file, link or directory tree. Entries that begin with a dot are left alone, and so is
+// the directory that holds one. Leaves the working directory in the parent of path.
+int path_remove_tree(const char* path);
+
+// Makes the FIFO (mode 0600) when path is missing and opens it for reading and writing without
+// blocking, so that it never reports end-of-file. The caller owns the descriptor; -1 on failure.
+int fifo_create_open(const char* path);

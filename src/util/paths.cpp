@@ -1,0 +1,71 @@
+#include "util/paths.h"
+
+#include <cstring>
+
+#include "log/log.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t MOUNT_BASE_LENGTH = sizeof(MOUNT_BASE) - 1;
+
+constexpr char DEV_NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
+                                       "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                       "0123456789._-!";
+
+}  // namespace
+
+void path_dev_node(char* out, size_t size, const char* dev_name)
+{
+    text_format(out, size, "/dev/%s", dev_name);
+}
+
+void path_sys_disk(char* out, size_t size, const char* disk_name)
+{
+    text_format(out, size, "%s/%s", SYS_BLOCK, disk_name);
+}
+
+void path_sys_size(char* out, size_t size, const char* dev_name)
+{
+    text_format(out, size, "/sys/class/block/%s/size", dev_name);
+}
+
+void path_sys_part_size(char* out, size_t size, const char* disk_name, const char* dev_name)
+{
+    text_format(out, size, "/sys/block/%s/%s/size", disk_name, dev_name);
+}
+
+void path_sys_sector_size(char* out, size_t size, const char* disk_name)
+{
+    text_format(out, size, "/sys/block/%s/queue/hw_sector_size", disk_name);
+}
+
+void path_mount_name(char* out, size_t size, int32_t disk_number, int32_t part_number)
+{
+    text_format(out, size, "disk%d_part%d", disk_number, part_number);
+}
+
+void path_mount_dir(char* out, size_t size, const char* mount_name)
+{
+    text_format(out, size, "%s/%s", MOUNT_BASE, mount_name);
+}
+
+int mount_path_to_name(const char* mount_path, char* out, size_t size)
+{
+    if (mount_path == nullptr || out == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    if (strlen(mount_path) < MOUNT_BASE_LENGTH) {
+        log_err("err mount = %s\n", mount_path);
+        return 1;
+    }
+    const char* name = mount_path + MOUNT_BASE_LENGTH;
+    text_copy(out, size, *name == '/' ? name + 1 : name);
+    return 0;
+}
+
+bool dev_name_is_shell_safe(const char* name)
+{
+    return name[strspn(name, DEV_NAME_CHARACTERS)] == '\0';
+}

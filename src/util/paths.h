@@ -1,0 +1,63 @@
+// Every path of the daemon, and every name derived from another, is made here.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+
+constexpr size_t PATH_SIZE = 128;     // buffers for paths below the fixed directories
+constexpr size_t COMMAND_SIZE = 128;  // buffers for shell commands; longer ones are cut
+
+// What other programs see. The doubled slashes belong to the names.
+inline constexpr char RUNTIME_DIR[] = "/tmp/tarn_nas/";
+inline constexpr char PID_FILE[] = "/tmp/tarn_nas//disk_manager_pid";
+inline constexpr char DISK_JSON_FILE[] = "/tmp/tarn_nas//disk.json";
+inline constexpr char DISK_NUM_FILE[] = "/tmp/tarn_nas//disk_num.txt";
+inline constexpr char PIPE_ADD_REMOVE[] = "/tmp/tarn_nas/pipe_disk_add_remove";
+inline constexpr char PIPE_SAFE_REMOVE[] = "/tmp/tarn_nas/pipe_disk_safe_remove";
+inline constexpr char PIPE_REMOVE[] = "/tmp/tarn_nas/pipe_disk_remove";
+inline constexpr char CONFIG_DIR[] = "/etc/config/tarn_nas";
+inline constexpr char DISK_DB_FILE[] = "/etc/config/tarn_nas/disk.db";
+inline constexpr char MOUNT_BASE[] = "/tmp/mountd";
+inline constexpr char HOTPLUG_MOUNT_HOOK[] = "/etc/hotplug.d/block/10-mount";
+
+// The kernel's.
+inline constexpr char SYS_BLOCK[] = "/sys/block";
+
+// Output of outside programs on its way back to us.
+inline constexpr char SCRATCH_PGREP[] = "/tmp/disk_pid_tmp";
+inline constexpr char SCRATCH_PIDOF[] = "/tmp/pid";
+inline constexpr char SCRATCH_MOUNT[] = "/tmp/mount.txt";
+inline constexpr char SCRATCH_DEV_CHECK[] = "/tmp/tmp_blkid";
+inline constexpr char SCRATCH_BLKID_TYPE[] = "/tmp/out.txt";
+inline constexpr char SCRATCH_BLKID_VALUE[] = "/tmp/disk_uid.txt";
+inline constexpr char SCRATCH_LABEL[] = "/tmp/disk_label";
+
+// An optional program of the router: prints the label of the device named by its argument.
+inline constexpr char LABEL_SCRIPT[] = "/usr/bin/disk_get_label.sh";
+
+// "/dev/%s" of a device name.
+void path_dev_node(char* out, size_t size, const char* dev_name);
+
+// The directory of a disk under /sys/block.
+void path_sys_disk(char* out, size_t size, const char* disk_name);
+
+// The size file of any block device by its own name, and of a partition below its disk.
+void path_sys_size(char* out, size_t size, const char* dev_name);
+void path_sys_part_size(char* out, size_t size, const char* disk_name, const char* dev_name);
+
+// The file with a disk's hardware sector size.
+void path_sys_sector_size(char* out, size_t size, const char* disk_name);
+
+// "disk%d_part%d": the directory name of a partition below the mount base.
+void path_mount_name(char* out, size_t size, int32_t disk_number, int32_t part_number);
+
+// The mount base joined with such a name.
+void path_mount_dir(char* out, size_t size, const char* mount_name);
+
+// The directory name out of a mount path: drops as many characters as the mount base has, without
+// comparing them, and one slash behind. 0, or 1 for a null argument or a path shorter than that.
+int mount_path_to_name(const char* mount_path, char* out, size_t size);
+
+// True when name holds nothing but what kernel device names are made of: letters, digits, and the
+// characters . _ - and !. Only such a name may become part of a shell command.
+bool dev_name_is_shell_safe(const char* name);

@@ -1,0 +1,61 @@
+#include "util/text.h"
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstring>
+
+void text_copy(char* out, size_t size, const char* text)
+{
+    text_copy_n(out, size, text, strlen(text));
+}
+
+void text_copy_n(char* out, size_t size, const char* text, size_t count)
+{
+    if (size == 0) {
+        return;
+    }
+    const size_t length = strnlen(text, count < size - 1 ? count : size - 1);
+    memmove(out, text, length);
+    memset(out + length, 0, size - length);
+}
+
+void text_format(char* out, size_t size, const char* fmt, ...)
+{
+    memset(out, 0, size);
+    va_list args;
+    va_start(args, fmt);
+    vsnprintf(out, size, fmt, args);
+    va_end(args);
+}
+
+bool text_has_prefix(const char* text, const char* prefix)
+{
+    return strncmp(text, prefix, strlen(prefix)) == 0;
+}
+
+int str_equal(const char* a, const char* b)
+{
+    return strcmp(a, b) == 0 ? 0 : 1;
+}
+
+int str_equal_nullsafe(const char* a, const char* b)
+{
+    if (a == nullptr || b == nullptr) {
+        return 1;
+    }
+    return str_equal(a, b);
+}
+
+int str_count_char_at_least(const char* text, int count)
+{
+    if (text == nullptr) {
+        return 1;
+    }
+    int dashes = 0;
+    for (const char* c = text; *c != '\0'; ++c) {
+        if (*c == '-') {
+            ++dashes;
+        }
+    }
+    return dashes >= count ? 1 : 0;
+}

@@ -1,0 +1,37 @@
+// Bounded text: every copy and every formatted buffer of the daemon goes through these.
+#pragma once
+
+#include <cstddef>
+
+// Copies text into out and zero-fills the rest; cut at size - 1 characters, always terminated.
+void text_copy(char* out, size_t size, const char* text);
+
+// Copies at most count characters of text the same way.
+void text_copy_n(char* out, size_t size, const char* text, size_t count);
+
+// snprintf into a zero-filled buffer; cutting is wanted, not an error.
+void text_format(char* out, size_t size, const char* fmt, ...)
+    __attribute__((format(printf, 3, 4)));
+
+bool text_has_prefix(const char* text, const char* prefix);
+
+// 0 when both have the same length and the same bytes, else 1.
+int str_equal(const char* a, const char* b);
+
+// 1 when either is null, else as str_equal.
+int str_equal_nullsafe(const char* a, const char* b);
+
+// 1 when text holds at least count "-" characters, else 0; 1 for a null text.
+int str_count_char_at_least(const char* text, int count);
+
+template <size_t N>
+void text_copy(char (&out)[N], const char* text)
+{
+    text_copy(out, N, text);
+}
+
+template <size_t N>
+void text_clear(char (&out)[N])
+{
+    text_copy(out, N, "");
+}
