@@ -1,0 +1,196 @@
+#include "disk/discovery.h"
+
+#include <unistd.h>
+
+#include <cstring>
+
+#include "disk/mount_point.h"
+#include "fs/fs_type.h"
+#include "log/log.h"
+#include "util/block_dev.h"
+#include "util/device.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t ROOT_NAME_SIZE = 64;
+constexpr int32_t BLKID_TEXT_SIZE = 512;
+constexpr size_t LINK_TARGET_SIZE = 256;
+constexpr int SDCARD_POINT_SIZE = 16;
+
+// blkid's output for the device, empty when the name must not reach a shell.
+void read_blkid_line(const char* dev_name, const char* dev_path, char (&text)[BLKID_TEXT_SIZE + 1])
+{
+    memset(text, 0, sizeof(text));
+    if (!dev_name_is_shell_safe(dev_name)) {
+        return;
+    }
+    char command[COMMAND_SIZE];
+    text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_DEV_CHECK);
+    exec_cmd(command, 1);
+    file_read_buf(SCRATCH_DEV_CHECK, text, BLKID_TEXT_SIZE);
+    file_delete(SCRATCH_DEV_CHECK);
+}
+
+// The disk of the inventory that owns a partition, added when it is missing; null when there is
+// none.
+disk_obj* find_or_add_owner(disk_sets* sets, const char* root_name)
+{
+    if (disk_sets_find_disk(sets, root_name) == nullptr) {
+        log_err("not find disk obj, root dev name = %s\n", root_name);
+        if (disk_sets_add_disk(sets, root_name) != 0) {
+            log_err("err!\n");
+            return nullptr;
+        }
+    }
+    disk_entry* entry = disk_sets_find_disk(sets, root_name);
+    if (entry == nullptr) {
+        log_err("Not find root part, dev = %s\n", root_name);
+        return nullptr;
+    }
+    return &entry->disk;
+}
+
+void log_root_fs(const disk_obj* disk)
+{
+    log_info("root part fs = %s\n", fs_type_name(disk->root.fs_type));
+}
+
+// True when the disk hangs on the router's SD card reader.
+bool is_at_sdcard_point(const char* link_target)
+{
+    char point[SDCARD_POINT_SIZE + 1]{};
+    if (device_get_sdcard_point(point, SDCARD_POINT_SIZE) != 0) {
+        return false;
+    }
+    return point[0] != '\0' && strstr(link_target, point) != nullptr;
+}
+
+}  // namespace
+
+int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("add dev name = %s\n", dev_name);
+    if (dev_check_blkid(dev_name) != 0) {
+        return 0;
+    }
+    if (disk_sets_find_part(sets, dev_name) != nullptr) {
+        log_warn("=== ===> dev is already add! dev name = %s\n", dev_name);
+        return 0;
+    }
+    if (sys_block_has_dev(dev_name) != 0) {
+        disk_sets_add_part(sets, dev_name);
+    } else {
+        disk_sets_add_disk(sets, dev_name);
+    }
+    return 0;
+}
+
+int disk_sets_add_disk(disk_sets* sets, const char* disk_name)
+{
+    disk_entry* entry = disk_sets_get_free_entry(sets);
+    if (entry == nullptr) {
+        return 1;
+    }
+    disk_obj* disk = &entry->disk;
+    disk_obj_set_root(disk, disk_name);
+    disk_obj_detect_sd_card(disk);
+    disk_obj_scan_parts(disk);
+    log_root_fs(disk);
+    disk_obj_read_sizes(disk);
+    log_root_fs(disk);
+    disk_obj_drop_small_parts(disk);
+    disk_obj_sort_parts_by_size(disk);
+    log_root_fs(disk);
+
+    // Before the first mount pass the disks wait to be sorted and numbered together.
+    if (sets->sorted_once == 0) {
+        return 0;
+    }
+    disk->root.mount_point_num = get_mount_point_num(sets);
+    log_info("=== ===> set mount point num = %d\n", disk->root.mount_point_num);
+    number_sub_parts(disk);
+    return 0;
+}
+
+void disk_sets_add_part(disk_sets* sets, const char* part_name)
+{
+    char root_name[ROOT_NAME_SIZE]{};
+    if (sys_block_find_parent(part_name, root_name, sizeof(root_name)) != 0) {
+        log_err("not find dev name = %s\n", part_name);
+        return;
+    }
+    disk_obj* disk = find_or_add_owner(sets, root_name);
+    // Adding the owner has scanned all its partitions, this one included as a rule.
+    if (disk == nullptr || disk_obj_has_dev(disk, part_name) == 0) {
+        return;
+    }
+    if (disk_obj_add_sub_part(disk, part_name) == 0) {
+        // A partition without a size would be dropped as small by the next mount pass. The slots
+        // are not sorted: those that are mounted must keep their numbers.
+        disk_obj_read_sizes(disk);
+    }
+}
+
+int dev_check_blkid(const char* dev_name)
+{
+    if (dev_name == nullptr) {
+        return 1;
+    }
+    char dev_path[PATH_SIZE];
+    path_dev_node(dev_path, sizeof(dev_path), dev_name);
+    char text[BLKID_TEXT_SIZE + 1];
+    read_blkid_line(dev_name, dev_path, text);
+    log_info("buf = %s\n", text);
+    log_info("dev = %s\n", dev_path);
+
+    if (!text_has_prefix(text, dev_path)) {
+        log_info("=== ===> dev err, dev = %s\n", dev_path);
+        return 1;
+    }
+    log_info("=== ===> dev ok, dev = %s\n", dev_path);
+    return 0;
+}
+
+void disk_obj_scan_parts(disk_obj* disk)
+{
+    char path[PATH_SIZE];
+    path_sys_disk(path, sizeof(path), disk->root.dev_name);
+    log_info("check path = %s\n", path);
+    dir_stream dir(path);
+    if (dir.stream == nullptr) {
+        log_err("open dir err, dir = %s\n", SYS_BLOCK);
+        return;
+    }
+    while (const char* name = dir.next_name()) {
+        if (dev_name_is_disk(name) == 0) {
+            disk_obj_add_sub_part(disk, name);
+        }
+    }
+}
+
+void disk_obj_detect_sd_card(disk_obj* disk)
+{
+    if (text_has_prefix(disk->root.dev_name, "mmcblk")) {
+        disk->sd_card = 1;
+        return;
+    }
+    char path[PATH_SIZE];
+    path_sys_disk(path, sizeof(path), disk->root.dev_name);
+    char target[LINK_TARGET_SIZE + 1]{};
+    if (readlink(path, target, LINK_TARGET_SIZE) < 0) {
+        text_clear(target);
+    }
+    log_info("read link path = %s\n", target);
+
+    disk->sd_card = is_at_sdcard_point(target) ? 1 : 0;
+    if (disk->sd_card == 1) {
+        log_info("find sd card ok, dev = %s\n", path);
+    }
+}

@@ -1,0 +1,17 @@
+// The status files that tell other programs which disks and partitions are usable.
+#pragma once
+
+#include "disk/disk_sets.h"
+
+// Clears empty disks, then writes both files.
+void disk_sets_publish(disk_sets* sets);
+
+// Writes "disk.json". A partition without a label gets its device name as label. 0, also when the
+// document could not be printed; 1 when it could not be begun.
+int disk_status_write_json(disk_sets* sets);
+
+// Writes the number of disks. 0 or 1.
+int disk_status_write_count(const disk_sets* sets);
+
+// Writes the document of a router without any disk.
+int disk_status_write_empty_json();

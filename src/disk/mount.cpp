@@ -1,0 +1,221 @@
+#include "disk/mount.h"
+
+#include <cstddef>
+
+#include "disk/disk_db.h"
+#include "disk/mount_point.h"
+#include "disk/mount_table.h"
+#include "fs/fs_type.h"
+#include "log/log.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/mount_cmd.h"
+#include "util/paths.h"
+#include "util/pause.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t DEV_PATH_SIZE = 64;
+constexpr int32_t ROOT_PART_NUMBER = 1;
+
+// Proposes the directory that the part's numbers stand for.
+void plan_mount_path(part_info* part)
+{
+    const int32_t disk_number = part->ref_root != nullptr ? part->ref_root->mount_point_num : 0;
+    const int32_t part_number = part->is_root_part == 1 ? ROOT_PART_NUMBER : part->mount_point_num;
+    path_mount_name(part->disk_name, sizeof(part->disk_name), disk_number, part_number);
+    path_mount_dir(part->mount_path, sizeof(part->mount_path), part->disk_name);
+    log_info("mout path = %s\n", part->mount_path);
+}
+
+void make_mount_dir(const char* mount_path)
+{
+    dir_make(mount_path);
+    char command[COMMAND_SIZE];
+    text_format(command, sizeof(command), "chmod a+wr %s", mount_path);
+    exec_cmd(command, 1);
+}
+
+void run_mount(const char* format, const char* dev_path, const char* mount_path)
+{
+    char command[COMMAND_SIZE];
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"
+    text_format(command, sizeof(command), format, dev_path, mount_path);
+#pragma GCC diagnostic pop
+    exec_cmd(command, 1);
+}
+
+// A userspace filesystem takes its time to appear in the mount table.
+bool wait_until_mounted(const char* dev_path)
+{
+    for (int i = 0; i < MOUNT_WAIT_TRIES; ++i) {
+        pause_seconds(MOUNT_WAIT_SECONDS);
+        if (is_dev_mounted(dev_path) == 1) {
+            return true;
+        }
+    }
+    return false;
+}
+
+void fill_record(disk_db_record* record, const part_info* part)
+{
+    text_copy(record->uid, part->uid);
+    text_copy(record->dev_name, part->dev_name);
+    text_copy(record->disk_name, part->disk_name);
+    text_copy(record->mount_path, part->mount_path);
+    record->mountd = 1;
+}
+
+void store_new_row(const part_info* part)
+{
+    disk_db_record record{};
+    fill_record(&record, part);
+    disk_db_add(&record);
+}
+
+// Another device sits in the remembered directory: the part keeps its new one.
+void overwrite_row(disk_db_record* record, const part_info* part)
+{
+    log_info("=== ===> update uid = %s, mount = %s\n", part->uid, part->mount_path);
+    text_copy(record->dev_name, part->dev_name);
+    text_copy(record->disk_name, part->disk_name);
+    text_copy(record->mount_path, part->mount_path);
+    record->mountd = 1;
+    disk_db_update_all(record);
+}
+
+void take_remembered_path(part_info* part, disk_db_record* record)
+{
+    if (str_equal_nullsafe(part->mount_path, record->mount_path) != 0) {
+        log_info("===> update mount path %s --> %s\n", part->mount_path, record->mount_path);
+        text_copy(part->mount_path, record->mount_path);
+    }
+    if (str_equal_nullsafe(part->disk_name, record->disk_name) != 0) {
+        log_info("===> update disk name %s --> %s\n", part->disk_name, record->disk_name);
+        text_copy(part->disk_name, record->disk_name);
+    }
+    record->mountd = 1;
+    disk_db_set_mountd(record);
+}
+
+}  // namespace
+
+int mount_all(disk_sets* sets)
+{
+    if (sets == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    disk_sets_drop_small_parts(sets);
+    if (sets->sorted_once == 0) {
+        sets->sorted_once = 1;
+        disk_sets_sort_by_size(sets);
+        set_all_mount_point_num(sets);
+    }
+    mount_disk_sets(sets);
+    disk_sets_refresh_sizes(sets);
+    return 0;
+}
+
+int mount_disk_sets(disk_sets* sets)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("*** *** *** mount path\n");
+    for (disk_entry& entry : sets->entries) {
+        if (entry.in_use == 1) {
+            number_sub_parts(&entry.disk);
+            mount_root_part(&entry.disk);
+            mount_sub_parts(&entry.disk);
+        }
+    }
+    return 0;
+}
+
+int mount_root_part(disk_obj* disk)
+{
+    if (disk == nullptr) {
+        return 1;
+    }
+    log_info("*** *** *** mount root path\n");
+    if (disk->root.fs_type == FS_NONE) {
+        log_warn("root path fs type err\n");
+        return 0;
+    }
+    log_info("=== ===> mount root part, dev name = %s\n", disk->root.dev_name);
+    mount_part(&disk->root);
+    return 0;
+}
+
+int mount_sub_parts(disk_obj* disk)
+{
+    if (disk == nullptr) {
+        return 1;
+    }
+    for (int i = 0; i < MAX_SUB_PARTS; ++i) {
+        part_slot* slot = &disk->parts[i];
+        if (slot->in_use == 1) {
+            log_info("=== ===> mount sub part, i = %d, name = %s\n", i, slot->part.dev_name);
+            mount_part(&slot->part);
+        }
+    }
+    return 0;
+}
+
+void mount_part(part_info* part)
+{
+    if (part == nullptr) {
+        return;
+    }
+    log_info("*** *** *** mount part, status = %d\n", part->mount_status);
+    if (part->mount_status == 1) {
+        log_warn("already mount %s ==> %s\n", part->dev_name, part->mount_path);
+        return;
+    }
+    char dev_path[DEV_PATH_SIZE];
+    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    text_clear(part->disk_name);
+    if (is_dev_mounted(dev_path) == 1) {
+        log_warn("already mounted, dev = %s\n", dev_path);
+        return;
+    }
+    plan_mount_path(part);
+    sync_part_with_db(part);
+
+    const char* format = fs_mount_cmd_format(part->fs_type);
+    if (format == nullptr) {
+        log_err("err fs type = %s\n", fs_type_name(part->fs_type));
+        return;
+    }
+    log_info("mout path = %s\n", part->mount_path);
+    make_mount_dir(part->mount_path);
+    run_mount(format, dev_path, part->mount_path);
+    if (!wait_until_mounted(dev_path)) {
+        log_warn("=== === === mount ERROR, %s ==> %s\n", dev_path, part->mount_path);
+        return;
+    }
+    log_info("mount OK, %s ==> %s\n", dev_path, part->mount_path);
+    part->mount_status = 1;
+}
+
+void sync_part_with_db(part_info* part)
+{
+    if (part == nullptr) {
+        return;
+    }
+    disk_db_record record{};
+    const int ret = disk_db_get(part->uid, &record);
+    log_info("=== === ===> db ret = %d\n", ret);
+    if (ret != 0) {
+        store_new_row(part);
+        return;
+    }
+    if (is_path_mounted(record.mount_path) == 1) {
+        overwrite_row(&record, part);
+        return;
+    }
+    take_remembered_path(part, &record);
+}

@@ -1,0 +1,170 @@
+#include "disk/mount_table.h"
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "log/log.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t LINE_SIZE = 512;
+constexpr char BLANKS[] = " \n";
+constexpr char DIGITS[] = "0123456789";
+
+// "%s/disk" of the mount base; of a path only as many characters are skipped, not compared.
+constexpr size_t PATH_PREFIX_LENGTH = sizeof(MOUNT_BASE) - 1 + sizeof("/disk") - 1;
+
+const char* first_digit(const char* text)
+{
+    return strpbrk(text, DIGITS);
+}
+
+const char* skip_prefix(const char* path)
+{
+    const size_t length = strlen(path);
+    return path + (length < PATH_PREFIX_LENGTH ? length : PATH_PREFIX_LENGTH);
+}
+
+}  // namespace
+
+int read_mount_table(mount_table* table)
+{
+    if (table == nullptr) {
+        return 1;
+    }
+    memset(table, 0, sizeof(*table));
+    char command[COMMAND_SIZE];
+    text_format(command, sizeof(command), "mount > %s", SCRATCH_MOUNT);
+    exec_cmd(command, 1);
+
+    FILE* listing = fopen(SCRATCH_MOUNT, "re");
+    if (listing == nullptr) {
+        log_err("err, fn = %s\n", SCRATCH_MOUNT);
+        return 1;
+    }
+    char line[LINE_SIZE];
+    while (fgets(line, sizeof(line), listing) != nullptr) {
+        parse_mount_line(table, line);
+    }
+    fclose(listing);
+    file_delete(SCRATCH_MOUNT);
+    return 0;
+}
+
+int parse_mount_line(mount_table* table, const char* line)
+{
+    if (table == nullptr || line == nullptr) {
+        return 1;
+    }
+    const char* path = strstr(line, MOUNT_BASE);
+    if (path == nullptr) {
+        return 1;
+    }
+    if (!text_has_prefix(line, "/dev/sd") && !text_has_prefix(line, "/dev/mmcblk0")) {
+        return 1;
+    }
+    if (table->num >= MOUNT_TABLE_SIZE) {
+        return 1;
+    }
+    const int32_t index = table->num;
+    mount_entry* entry = &table->entries[index];
+    text_copy_n(entry->dev, sizeof(entry->dev), line, strcspn(line, BLANKS));
+    text_copy_n(entry->path, sizeof(entry->path), path, strcspn(path, BLANKS));
+    parse_mount_point_num(entry->path, &entry->main, &entry->sub);
+    log_info("get dev mount[%d] %s ==> %s\n", index, entry->dev, entry->path);
+    log_info("mount pont[%d] main = %d, sub = %d\n", index, entry->main, entry->sub);
+    ++table->num;
+    return 0;
+}
+
+void parse_mount_point_num(const char* path, int32_t* main_number, int32_t* sub_number)
+{
+    if (path == nullptr) {
+        log_err("err!\n");
+        return;
+    }
+    const char* rest = skip_prefix(path);
+    const char* main_text = first_digit(rest);
+    const char* underscore = main_text != nullptr ? strchr(main_text, '_') : nullptr;
+    const char* sub_text = underscore != nullptr ? first_digit(underscore) : nullptr;
+    if (sub_text == nullptr) {
+        log_err("err str = %s\n", rest);
+        return;
+    }
+    const int32_t main_value = atoi(main_text);
+    const int32_t sub_value = atoi(sub_text);
+    if (main_number != nullptr) {
+        *main_number = main_value;
+    }
+    if (sub_number != nullptr) {
+        *sub_number = sub_value;
+    }
+    log_info("get port = %d %d\n", main_value, sub_value);
+}
+
+int find_mount_by_dev(const mount_table* table, const char* dev_path)
+{
+    for (int i = 0; table != nullptr && i < table->num; ++i) {
+        if (str_equal_nullsafe(table->entries[i].dev, dev_path) == 0) {
+            return i;
+        }
+    }
+    return -1;
+}
+
+int find_mount_by_path(const mount_table* table, const char* path)
+{
+    for (int i = 0; table != nullptr && i < table->num; ++i) {
+        if (str_equal_nullsafe(table->entries[i].path, path) == 0) {
+            return i;
+        }
+    }
+    return -1;
+}
+
+int is_dev_mounted(const char* dev_path)
+{
+    return get_dev_mount_path(dev_path, nullptr);
+}
+
+int is_path_mounted(const char* path)
+{
+    if (path == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    mount_table table;
+    if (read_mount_table(&table) != 0) {
+        return 0;
+    }
+    return find_mount_by_path(&table, path) >= 0 ? 1 : 0;
+}
+
+int get_dev_mount_path(const char* dev_path, char* out)
+{
+    if (dev_path == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    mount_table table;
+    if (read_mount_table(&table) != 0) {
+        return 0;
+    }
+    int mounted = 0;
+    for (int i = 0; i < table.num; ++i) {
+        const mount_entry* entry = &table.entries[i];
+        if (str_equal(entry->dev, dev_path) != 0) {
+            continue;
+        }
+        mounted = 1;
+        if (out != nullptr) {
+            text_copy(out, MOUNT_PATH_SIZE, entry->path);
+        }
+    }
+    return mounted;
+}

@@ -1,0 +1,180 @@
+#include "disk/removal.h"
+
+#include <cstddef>
+
+#include "disk/disk_db.h"
+#include "disk/mount_table.h"
+#include "log/log.h"
+#include "util/block_dev.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/pause.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t DEV_PATH_SIZE = 64;
+
+void run_umount(const char* target)
+{
+    char command[COMMAND_SIZE];
+    text_format(command, sizeof(command), "umount %s", target);
+    exec_cmd(command, 1);
+}
+
+void umount_until_gone(const char* dev_path)
+{
+    char mounted_at[MOUNT_PATH_SIZE]{};
+    for (int i = 0; i < UMOUNT_TRIES; ++i) {
+        if (get_dev_mount_path(dev_path, mounted_at) != 1) {
+            return;
+        }
+        run_umount(mounted_at);
+        pause_seconds(1);
+    }
+}
+
+void note_unmounted(const char* uid)
+{
+    disk_db_record record{};
+    text_copy(record.uid, uid);
+    disk_db_set_mountd(&record);
+}
+
+// The disk that holds a partition record.
+disk_obj* owner_of(disk_sets* sets, const part_info* part)
+{
+    for (disk_entry& entry : sets->entries) {
+        if (entry.in_use == 1 && part->ref_root == &entry.disk.root) {
+            return &entry.disk;
+        }
+    }
+    return nullptr;
+}
+
+}  // namespace
+
+void umount_part(const part_info* part)
+{
+    if (part == nullptr) {
+        return;
+    }
+    log_warn("==> umount dev = %s\n", part->dev_name);
+    char dev_path[DEV_PATH_SIZE];
+    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    if (part->dev_name[0] != '\0') {
+        run_umount(dev_path);
+    }
+    if (part->mount_path[0] != '\0') {
+        run_umount(part->mount_path);
+    }
+    umount_until_gone(dev_path);
+    note_unmounted(part->uid);
+}
+
+int umount_disk_parts(disk_obj* disk)
+{
+    if (disk == nullptr) {
+        return 1;
+    }
+    log_warn("remove disk, root dev = %s\n", disk->root.dev_name);
+    for (const part_slot& slot : disk->parts) {
+        if (slot.in_use == 1) {
+            umount_part(&slot.part);
+        }
+    }
+    log_warn("=== === ===> remove root path:\n");
+    umount_part(&disk->root);
+    return 0;
+}
+
+int remove_root_part(disk_sets* sets, const char* disk_name)
+{
+    disk_entry* entry = disk_sets_find_disk(sets, disk_name);
+    if (entry == nullptr) {
+        log_warn("remove root part[%s] err!\n", disk_name);
+        return 1;
+    }
+    umount_disk_parts(&entry->disk);
+    disk_entry_clear(entry);
+    return 0;
+}
+
+int remove_sub_part(disk_sets* sets, const char* dev_name)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("remove dev name = %s\n", dev_name);
+    part_info* part = disk_sets_find_part(sets, dev_name);
+    if (part == nullptr) {
+        log_warn("want remove dev(%s) not exist!\n", dev_name);
+        return 0;
+    }
+    log_info("want to remove:\n");
+    part_info_dump(part);
+    umount_part(part);
+    disk_obj_clear_part(owner_of(sets, part), part);
+    return 0;
+}
+
+int remove_dev(disk_sets* sets, const char* dev_name)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("remove dev name = %s\n", dev_name);
+    if (disk_sets_find_part(sets, dev_name) == nullptr) {
+        log_warn("want remove dev(%s) not exist!\n", dev_name);
+        return 0;
+    }
+    if (sys_block_has_dev(dev_name) != 0) {
+        log_warn("remove sub dev = %s\n", dev_name);
+        remove_sub_part(sets, dev_name);
+    } else {
+        log_warn("remove root dev = %s\n", dev_name);
+        remove_root_part(sets, dev_name);
+    }
+    disk_sets_clear_empty(sets);
+    return 0;
+}
+
+int remove_disk(disk_sets* sets, const char* disk_name)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("remove disk name = %s\n", disk_name);
+    for (disk_entry& entry : sets->entries) {
+        if (entry.in_use == 0) {
+            continue;
+        }
+        part_info* part = disk_obj_find_part_by_disk_name(&entry.disk, disk_name);
+        if (part != nullptr) {
+            umount_part(part);
+            disk_obj_clear_part(&entry.disk, part);
+            disk_sets_clear_empty(sets);
+            return 0;
+        }
+    }
+    return 0;
+}
+
+int safe_remove_all(disk_sets* sets)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    dir_stream dir(SYS_BLOCK);
+    if (dir.stream == nullptr) {
+        log_err("open dir err, dir = %s\n", SYS_BLOCK);
+        return 1;
+    }
+    while (const char* name = dir.next_name()) {
+        if (dev_name_is_disk(name) == 0) {
+            remove_dev(sets, name);
+        }
+    }
+    return 0;
+}
