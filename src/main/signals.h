@@ -1,0 +1,11 @@
+// What the daemon does on signals: SIGTERM is ignored on purpose, the second SIGINT ends the loop,
+// SIGUSR2 copies the log to syslog, others are only logged.
+#pragma once
+
+#include <cstdint>
+
+// Number of SIGINTs seen.
+extern volatile int32_t sigint_count;
+
+// Always 0.
+int setup_signals();

@@ -1,0 +1,303 @@
+#include "manager/manager.h"
+
+#include <cstring>
+
+#include "disk/discovery.h"
+#include "disk/disk_status.h"
+#include "disk/mount.h"
+#include "disk/mount_point.h"
+#include "disk/removal.h"
+#include "log/log.h"
+#include "manager/rescan.h"
+#include "manager/services.h"
+#include "util/block_dev.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/pause.h"
+#include "util/process.h"
+#include "util/text.h"
+
+volatile int32_t running = 1;
+int32_t restart_requested = 0;
+
+namespace {
+
+constexpr int32_t SYS_TIMEOUT_SECONDS = 60;
+constexpr int32_t SYS_TIMEOUT_FACTOR = 5;
+constexpr char COMPANION_PROCESS[] = "tarn_nas_sys";
+
+constexpr time_t REFRESH_AFTER_SECONDS = 4;
+constexpr time_t UPDATE_EVERY_SECONDS = 3;
+constexpr time_t PUBLISH_AFTER_SECONDS = 29;
+constexpr time_t RESCAN_EVERY_SECONDS = 8;
+
+disk_manager the_manager;
+
+// The heart-beat limit. Each safe removal lengthens it for the rest of the process's life.
+int32_t sys_timeout = SYS_TIMEOUT_SECONDS;
+
+// Adds every disk that the kernel lists. 1 when there was any, 0 when none, -1 when the list cannot
+// be read.
+int add_all_disks(disk_sets* disks)
+{
+    dir_stream dir(SYS_BLOCK);
+    if (dir.stream == nullptr) {
+        log_err("open dir err, dir = %s\n", SYS_BLOCK);
+        return -1;
+    }
+    log_info("scan path = %s\n", SYS_BLOCK);
+    int have_disk = 0;
+    while (const char* name = dir.next_name()) {
+        log_info("d_name = %s\n", name);
+        if (dev_name_is_disk(name) == 0) {
+            disk_sets_add_dev(disks, name);
+            have_disk = 1;
+        }
+    }
+    log_info("have disk = %d\n", have_disk);
+    return have_disk;
+}
+
+// False when nobody has written an event for too long and the companion process is gone.
+bool somebody_is_there(time_t* last, time_t now)
+{
+    const time_t silence = now - *last;
+    if (silence <= sys_timeout) {
+        return true;
+    }
+    log_warn("sys timeout, %d > %d\n", static_cast<int>(silence), sys_timeout);
+    if (proc_exists(COMPANION_PROCESS) != 1) {
+        return false;
+    }
+    *last = now;
+    return true;
+}
+
+int on_add(disk_manager* manager, const char* dev_name)
+{
+    const time_t now = time(nullptr);
+    manager->t_refresh = now;
+    manager->t_update = now;
+    manager->state = MANAGER_ACTIVE;
+    manager->changed = 1;
+    manager->update_due = 1;
+    return disk_sets_add_dev(&manager->disks, dev_name);
+}
+
+// The file services must not hold files open while something is unmounted.
+int on_remove(disk_manager* manager, const char* name, int (*operation)(disk_sets*, const char*))
+{
+    manager->changed = 1;
+    services_stop();
+    operation(&manager->disks, name);
+    services_start();
+    return 0;
+}
+
+int on_safe_remove(disk_manager* manager)
+{
+    log_info("===> safe remove disk\n");
+    services_stop();
+    safe_remove_all(&manager->disks);
+    services_start();
+    disk_sets_publish(&manager->disks);
+    manager->state = MANAGER_SAFE_REMOVED;
+    if (sys_timeout <= INT32_MAX / SYS_TIMEOUT_FACTOR) {
+        sys_timeout *= SYS_TIMEOUT_FACTOR;
+    }
+    return 0;
+}
+
+void publish_when_due(disk_manager* manager, time_t now)
+{
+    log_info("=== === ===> update = %d\n", manager->changed);
+    if (manager->changed == 1) {
+        manager->t_publish = now;
+        manager->changed = 0;
+        disk_sets_publish(&manager->disks);
+    } else if (now - manager->t_publish > PUBLISH_AFTER_SECONDS) {
+        // t_publish stays: with no change for so long the files are written in every idle cycle,
+        // which keeps the free space in them fresh.
+        disk_sets_publish(&manager->disks);
+    }
+}
+
+// Two mounts in one place, or a mount without its device: the daemon's memory cannot be trusted. It
+// starts again with a fresh database.
+void check_mount_consistency()
+{
+    const bool broken = check_mount_path_dup() != 0 || check_mount_dev_exist() != 0;
+    if (!broken) {
+        return;
+    }
+    file_delete(DISK_DB_FILE);
+    running = 0;
+    restart_requested = 1;
+}
+
+void do_periodic_work(disk_manager* manager)
+{
+    const time_t now = time(nullptr);
+    if (!path_exists(DISK_JSON_FILE)) {
+        manager->changed = 1;
+    }
+    if (now - manager->t_refresh > REFRESH_AFTER_SECONDS) {
+        manager->t_refresh = now;
+        disk_sets_refresh_sizes(&manager->disks);
+    }
+    if (now - manager->t_update >= UPDATE_EVERY_SECONDS || manager->update_due == 1) {
+        manager->t_update = now;
+        manager->update_due = 0;
+        mount_all(&manager->disks);
+    }
+    publish_when_due(manager, now);
+    if (now - manager->t_rescan < RESCAN_EVERY_SECONDS) {
+        return;
+    }
+    manager->t_rescan = now;
+    rescan_block_devices(&manager->disks, &manager->changed);
+    check_mount_consistency();
+}
+
+}  // namespace
+
+disk_manager* manager_get()
+{
+    return &the_manager;
+}
+
+int manager_init(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    memset(manager, 0, sizeof(*manager));
+    if (disk_sets_init(&manager->disks) != 0 || event_pipes_open(&manager->pipes) != 0) {
+        return 1;
+    }
+    manager->state = MANAGER_INITIALISED;
+    return 0;
+}
+
+int manager_free(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    event_pipes_close(&manager->pipes);
+    disk_sets_free(&manager->disks);
+    return 0;
+}
+
+int manager_scan(disk_manager* manager, int32_t mount_known)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    const int have_disk = add_all_disks(&manager->disks);
+    if (have_disk < 0) {
+        return 1;
+    }
+    if (have_disk == 0) {
+        disk_status_write_empty_json();
+        return 0;
+    }
+    manager->state = MANAGER_ACTIVE;
+    disk_sets_refresh_sizes(&manager->disks);
+    if (mount_known == 1) {
+        check_disks_mounted(&manager->disks);
+    }
+    mount_all(&manager->disks);
+    disk_sets_publish(&manager->disks);
+    return 0;
+}
+
+int manager_run(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    manager_scan(manager, 0);
+    while (running == 1) {
+        manager_event_loop(manager);
+        manager_free(manager);
+        if (manager_init(manager) != 0) {
+            return 0;
+        }
+        log_info("manager work again!\n");
+    }
+    return 0;
+}
+
+int manager_event_loop(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    time_t last = time(nullptr);
+    while (running == 1) {
+        const time_t now = time(nullptr);
+        if (!somebody_is_there(&last, now)) {
+            running = 0;
+            return 0;
+        }
+        if (event_receive(&manager->pipes) == 1) {
+            last = now;
+            manager_dispatch(manager);
+        } else {
+            log_warn("no event ...\n");
+            manager_idle(manager);
+        }
+    }
+    return 0;
+}
+
+int manager_dispatch(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    const disk_event* event = &manager->pipes.event;
+    log_info("===> get event = %s\n", event_name(event->type));
+    char name[EVENT_NAME_SIZE + 1];
+    text_copy_n(name, sizeof(name), event->dev_name, EVENT_NAME_SIZE);
+
+    switch (event->type) {
+        case EVENT_DISK_ADD:
+            return on_add(manager, name);
+        case EVENT_DISK_REMOVE_DEV:
+            return on_remove(manager, name, remove_dev);
+        case EVENT_DISK_REMOVE_DISK:
+            return on_remove(manager, name, remove_disk);
+        case EVENT_DISK_SAFE_REMOVE:
+            return on_safe_remove(manager);
+        case EVENT_DISK_HEART_BEAT:
+            return 0;
+        default:
+            log_err("err event type = %d\n", event->type);
+            return 1;
+    }
+}
+
+int manager_idle(disk_manager* manager)
+{
+    if (manager == nullptr) {
+        return 1;
+    }
+    switch (manager->state) {
+        case MANAGER_ACTIVE:
+            do_periodic_work(manager);
+            return 0;
+        case MANAGER_SAFE_REMOVED:
+            log_warn("disk safe remove ...\n");
+            pause_seconds(1);
+            return 0;
+        default:
+            return 0;
+    }
+}
+
+void loop_run_stop()
+{
+    running = 0;
+}

@@ -1,0 +1,120 @@
+#include "manager/services.h"
+
+#include <cstdint>
+#include <cstdlib>
+#include <ctime>
+
+#include "config/uci2.h"
+#include "log/log.h"
+#include "util/device.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/paths.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr size_t OPTION_SIZE = 32;
+constexpr time_t FIREWALL_PAUSE_SECONDS = 9;
+constexpr char WEBDAV_TARGET[] = "firewall.webdav_wan.target";
+
+constexpr const char* STOP_COMMANDS[] = {
+    "/etc/init.d/samba4 stop",
+    "/etc/init.d/nas_samba3 stop",
+    "/etc/init.d/tarn_nas_sys_dl stop",
+    "/etc/init.d/tarn_nas_sys_up stop",
+};
+
+// The same order as stopping, not the reverse: none of them needs another.
+constexpr const char* START_COMMANDS[] = {
+    "/etc/init.d/samba4 start",
+    "/etc/init.d/nas_samba3 start",
+    "/etc/init.d/tarn_nas_sys_dl start",
+    "/etc/init.d/tarn_nas_sys_up start",
+};
+
+// Once set they stay set: the rule fires at most once in the life of the process.
+int32_t ser_port_set = 0;
+int32_t webdav_port_set = 0;
+time_t t_firewall = 0;
+
+bool option_is_set(uci_context* ctx, const char* path)
+{
+    char value[OPTION_SIZE];
+    uci2_get(ctx, path, value, sizeof(value));
+    return value[0] == '1';
+}
+
+int published_disk_count()
+{
+    char text[OPTION_SIZE + 1]{};
+    file_read_buf(DISK_NUM_FILE, text, OPTION_SIZE);
+    return atoi(text);
+}
+
+// Reads the rule's target and turns a "DROP" into "ACCEPT".
+void accept_webdav(uci_context* ctx, char (&target)[OPTION_SIZE])
+{
+    uci2_get(ctx, WEBDAV_TARGET, target, sizeof(target));
+    if (!text_has_prefix(target, "DROP")) {
+        return;
+    }
+    uci2_set(ctx, WEBDAV_TARGET, "ACCEPT");
+    uci2_commit(ctx, "firewall");
+    webdav_port_set = 1;
+    firewall_reload();
+}
+
+void apply_webdav_rule(uci_context* ctx)
+{
+    if (option_is_set(ctx, "nas.conf.tarnser_port_set")) {
+        ser_port_set = 1;
+    }
+    if (option_is_set(ctx, "nas.conf.webdav_port_set")) {
+        webdav_port_set = 1;
+        return;
+    }
+    if (ser_port_set == 1 || webdav_port_set == 1) {
+        return;
+    }
+    const char tarnnas_target[OPTION_SIZE]{};
+    char webdav_target[OPTION_SIZE]{};
+    if (published_disk_count() > 0) {
+        accept_webdav(ctx, webdav_target);
+    }
+    log_info("tarnnas target = %s\n", tarnnas_target);
+    log_info("webdav target = %s\n", webdav_target);
+}
+
+}  // namespace
+
+void services_stop()
+{
+    for (const char* command : STOP_COMMANDS) {
+        exec_cmd(command, 1);
+    }
+}
+
+void services_start()
+{
+    for (const char* command : START_COMMANDS) {
+        exec_cmd(command, 1);
+    }
+}
+
+int firewall_webdav_check()
+{
+    const time_t now = time(nullptr);
+    if (now - t_firewall <= FIREWALL_PAUSE_SECONDS) {
+        return 0;
+    }
+    t_firewall = now;
+    uci_context* ctx = uci2_new();
+    if (ctx == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    apply_webdav_rule(ctx);
+    uci2_free(ctx);
+    return 0;
+}
