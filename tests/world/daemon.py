@@ -83,14 +83,18 @@ class Daemon:
                  timeout or 10 + 25 * count, f"{count} idle cycles")
 
     def wait_rescan(self, timeout=60):
-        """Wait for the end of a rescan that begins after this call.
-
-        The rescan itself prints nothing when nothing changed; the consistency
-        check that follows it does.  The first one seen may have begun before.
-        """
+        """Wait for the end of a rescan that begins after this call."""
         mark = self.mark()
-        wait_for(lambda: self._count("mount dev num = ", mark) >= 4 or not self.running,
-                 timeout, "two rescans")
+        wait_for(lambda: self.rescanned_since(mark) or not self.running, timeout, "a rescan")
+
+    def rescanned_since(self, mark):
+        """True when a rescan that began after `mark` is over.
+
+        A rescan that finds nothing new prints nothing, but the consistency check
+        that follows it prints this line twice.  Of three such lines the last one
+        belongs to a rescan begun after the mark, wherever the mark fell.
+        """
+        return self._count("mount dev num = ", mark) >= 3
 
     def wait_exit(self, timeout=30):
         """Wait until it has ended; returns the exit status."""

@@ -18,7 +18,7 @@ from . import state
 from .daemon import Daemon, child_of
 from .events import PIPES, add_messages, remove_messages, write_pipe
 from .sysfs import Sysfs
-from .tools import BUSYBOX, LABEL_SCRIPT, Tools
+from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools
 from .waiting import wait_for
 
 CHECKOUT = Path(__file__).resolve().parents[2]
@@ -159,13 +159,16 @@ class World:
         process = self.popen(self.tools.companion_program(), "infinity",
                              stdin=subprocess.DEVNULL)
         self._processes.append(process)
-        wait_for(lambda: self.run("pidof", "tarn_nas_sys", check=False).stdout.strip(),
-                 10, "the companion process")
+        wait_for(self._companion_runs, 10, "the companion process")
         return process
 
     def stop_companion(self, process):
-        """End a process of `start_companion`."""
+        """End a process of `start_companion`; `pidof` no longer finds it."""
         self._kill_group(process)
+        wait_for(lambda: not self._companion_runs(), 10, "the companion's end")
+
+    def _companion_runs(self):
+        return self.run("pidof", COMPANION, check=False).stdout.strip()
 
     # Disks.
 
