@@ -10,6 +10,8 @@ sys.path.insert(0, str(Path(__file__).resolve().parents[1]))
 from world import World, kernel_has, missing  # noqa: E402
 from world.world import PROGRAM  # noqa: E402
 
+_WORLDS = pytest.StashKey[list]()
+
 
 def pytest_configure(config):
     config.addinivalue_line(
@@ -38,16 +40,9 @@ def pytest_runtest_makereport(item):
     """Put the worlds' state and the daemon's log beside a failed test."""
     outcome = yield
     report = outcome.get_result()
-    if report.failed and call_made_worlds(item):
-        for number, world in enumerate(item.stash[_WORLDS], 1):
+    if report.failed:
+        for number, world in enumerate(item.stash.get(_WORLDS, []), 1):
             report.sections.append((f"world {number}", world.diagnosis()))
-
-
-_WORLDS = pytest.StashKey[list]()
-
-
-def call_made_worlds(item):
-    return item.stash.get(_WORLDS, [])
 
 
 @pytest.fixture

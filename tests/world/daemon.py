@@ -1,5 +1,6 @@
 """The daemon as a process of a world: start, log, signals, end."""
 
+import contextlib
 import os
 import signal
 import time
@@ -25,8 +26,8 @@ class Daemon:
     def __init__(self, process, log_path):
         self.process = process
         self.log_path = Path(log_path)
-        self.outer_pid = wait_for(lambda: child_of(process.pid) or not self.running, 10,
-                                  "the daemon's process")
+        self.outer_pid = 0
+        wait_for(self._find_process, 10, "the daemon's process")
 
     @property
     def running(self):
@@ -79,13 +80,13 @@ class Daemon:
     def wait_idle_cycles(self, count=1, timeout=None):
         """Wait for `count` further cycles that found no event (3 s each)."""
         mark = self.mark()
-        wait_for(lambda: self._count("no event ...", mark) >= count or not self.running,
-                 timeout or 10 + 25 * count, f"{count} idle cycles")
+        self._wait_alive(lambda: self._count("no event ...", mark) >= count,
+                         timeout or 10 + 25 * count, f"{count} idle cycles")
 
     def wait_rescan(self, timeout=60):
         """Wait for the end of a rescan that begins after this call."""
         mark = self.mark()
-        wait_for(lambda: self.rescanned_since(mark) or not self.running, timeout, "a rescan")
+        self._wait_alive(lambda: self.rescanned_since(mark), timeout, "a rescan")
 
     def rescanned_since(self, mark):
         """True when a rescan that began after `mark` is over.
@@ -102,9 +103,10 @@ class Daemon:
         return self.returncode
 
     def signal(self, number):
-        """Send a signal to the daemon itself."""
-        if self.running:
-            os.kill(self.outer_pid, number)
+        """Send a signal to the daemon itself; nothing when it has ended."""
+        if self.running and self.outer_pid:
+            with contextlib.suppress(ProcessLookupError):
+                os.kill(self.outer_pid, number)
 
     def stop(self, timeout=60):
         """Two SIGINTs and the end; returns the exit status.
@@ -137,6 +139,11 @@ class Daemon:
         folder = f"/proc/{self.outer_pid}/fd"
         return {int(name): os.readlink(f"{folder}/{name}") for name in os.listdir(folder)}
 
+    def _find_process(self):
+        """True once its pid is known, or it ended before it could be seen."""
+        self.outer_pid = child_of(self.process.pid)
+        return self.outer_pid or not self.running
+
     def _rollup(self, key):
         for line in Path(f"/proc/{self.outer_pid}/smaps_rollup").read_text().splitlines():
             if line.startswith(key):
@@ -145,6 +152,16 @@ class Daemon:
 
     def _count(self, text, since=0):
         return self.log_since(since).count(text)
+
+    def _wait_alive(self, condition, timeout, what):
+        """wait_for that raises DaemonGone as soon as the daemon has ended."""
+        def look():
+            if condition():
+                return True
+            if not self.running:
+                raise DaemonGone(f"ended with {self.returncode} before {what}; {self._tail()}")
+            return False
+        wait_for(look, timeout, what)
 
     def _wait_quietly(self, condition, timeout):
         try:

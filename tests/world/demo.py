@@ -34,15 +34,18 @@ def make_disks(world):
     return disks
 
 
-FIRST_NAMES = {"usb": "sda", "stick": "sdb", "card": "mmcblk0", "camera": "sdc"}
-# The other way round and under other names, as ports and timing decide.
-SECOND_NAMES = {"camera": "sda", "card": "mmcblk0", "stick": "sdb", "usb": "sdc"}
 DESCRIPTIONS = {
     "usb": "USB disk with two partitions, one of them only 500 MiB",
     "stick": "USB stick with a filesystem on the whole device",
     "card": "SD card",
     "camera": "USB stick with exFAT on the whole device",
 }
+
+
+def kernel_names(shorts):
+    """Names as the kernel gives them out in this order of plugging."""
+    letters = iter("abcdefgh")
+    return {short: "mmcblk0" if short == "card" else f"sd{next(letters)}" for short in shorts}
 
 
 def device_of(short, disk):
@@ -63,14 +66,14 @@ class Story:
 
     def run(self):
         self.begin()
-        for number, short in enumerate(self.disks, 1):
-            self.plug(short, FIRST_NAMES[short], f"disk{number}_part1")
+        for number, (short, name) in enumerate(kernel_names(self.disks).items(), 1):
+            self.plug(short, name, f"disk{number}_part1")
         self.check_small_is_ignored()
         self.write_files()
         self.pull_disk()
         self.pull_the_rest()
-        for short in sorted(self.disks, key=list(SECOND_NAMES).index):
-            self.plug(short, SECOND_NAMES[short], self.homes[short])
+        for short, name in kernel_names(reversed(self.disks)).items():
+            self.plug(short, name, self.homes[short])
         self.check_files()
         self.safe_removal()
         self.stop()
@@ -93,6 +96,9 @@ class Story:
         self.tell.wait(lambda: self.is_shown(device), MOUNT_TIMEOUT,
                        f"{device} to be mounted and published")
         self.show()
+        if disk.root_fs:
+            self.tell.say("   (of a filesystem on the whole device no label is read;"
+                          " the device name stands in)")
         part = self.world.parts()[device]
         self.tell.check(f"{device} is at {part.path}, expected {home}", part.disk_name == home)
         self.tell.check(f"SD card flag of {device} is {part.sd_card}",
@@ -215,7 +221,11 @@ def main(arguments):
         # On a router the companion keeps the daemon from ending in long silence.
         world.start_companion()
         print("Starting the daemon in a private world", flush=True)
-        daemon = world.start_daemon()
+        try:
+            daemon = world.start_daemon()
+        except AssertionError as error:
+            print(f"The daemon does not start: {error}", file=sys.stderr)
+            return 1
         tell = Narrator(lambda: daemon.running)
         if arguments:
             return Shell(world, daemon, tell, make_disks(world)).run(sys.stdin)

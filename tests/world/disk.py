@@ -28,7 +28,7 @@ _MKFS = {
     "ext4": (["mkfs.ext4", *_EXT], "-L"),
     "ntfs": (["mkntfs", "-q", "-Q", "-F"], "-L"),
     "vfat": (["mkfs.vfat", "-I"], "-n"),
-    "exfat": (["mkfs.exfat", "-q"], "-L"),
+    "exfat": (["mkfs.exfat"], "-L"),
     "swap": (["mkswap", "-q"], "-L"),
 }
 

@@ -5,7 +5,6 @@ import contextlib
 import json
 import os
 import shutil
-import socket
 import stat
 import subprocess
 import sys
@@ -18,6 +17,7 @@ from . import state
 from .daemon import Daemon, child_of
 from .events import PIPES, add_messages, remove_messages, write_pipe
 from .sysfs import Sysfs
+from .syslog import Syslog
 from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools
 from .waiting import wait_for
 
@@ -325,11 +325,9 @@ class World:
 
     # Outside services.
 
-    def syslog_socket(self):
-        """A bound /dev/log to receive from, with a time-out of 10 s."""
-        receiver = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
-        receiver.bind(str(self.path("/dev/log")))
-        receiver.settimeout(10)
+    def syslog(self):
+        """Put a /dev/log in place; returns the Syslog that reads it."""
+        receiver = Syslog(self.path("/dev/log"))
         self._sockets.append(receiver)
         return receiver
 
@@ -349,7 +347,7 @@ class World:
     def close(self):
         """End all processes, give back every mount and loop.  Safe to call twice.
 
-        Raises RuntimeError when the kernel keeps a loop attached.
+        Raises WaitTimeout when the kernel keeps a loop attached.
         """
         _live.discard(self)
         for process in self._processes:
