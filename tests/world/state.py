@@ -1,9 +1,12 @@
 """What the daemon and the kernel say about a world, read from outside."""
 
+import contextlib
 import json
 import re
 import sqlite3
+import time
 from dataclasses import dataclass
+from pathlib import Path
 
 DISK_JSON = "/tmp/tarn_nas/disk.json"
 DISK_NUM = "/tmp/tarn_nas/disk_num.txt"
@@ -75,3 +78,59 @@ def open_db(content):
         connection.deserialize(content)
     connection.row_factory = sqlite3.Row
     return connection
+
+
+class Observed:
+    """What can be seen of a world.  The heir has `keeper_pid` and the file
+    operations `path`, `read` and `exists`."""
+
+    def mounts(self, under=MOUNT_BASE):
+        """The world's mounts at or below a directory, oldest first."""
+        text = Path(f"/proc/{self.keeper_pid}/mounts").read_text()
+        return [entry for entry in parse_mounts(text)
+                if entry.path == under or entry.path.startswith(under.rstrip("/") + "/")]
+
+    def mounted(self):
+        """{device path: mount path} below the mount base."""
+        return {entry.dev: entry.path for entry in self.mounts()}
+
+    def disk_json(self):
+        """The published document, None when there is none or half of one."""
+        return load_json(self.read(DISK_JSON)) if self.exists(DISK_JSON) else None
+
+    def parts(self):
+        """Published partitions by device name."""
+        document = self.disk_json()
+        return {part.dev_name: part for part in parse_parts(document)} if document else {}
+
+    def disk_num(self):
+        """Text of the count file, None when there is none."""
+        return self.read(DISK_NUM) if self.exists(DISK_NUM) else None
+
+    def db_rows(self):
+        """Rows of the table "disk" as dicts in stored order; [] without a database.
+
+        Raises sqlite3.DatabaseError for a file that stays unreadable for 2 s.
+        """
+        for _ in range(40):
+            # The bytes may be read in the middle of one of the daemon's writes.
+            with contextlib.suppress(sqlite3.DatabaseError):
+                return self._db_rows_now()
+            time.sleep(0.05)
+        return self._db_rows_now()
+
+    def _db_rows_now(self):
+        if not self.exists(DISK_DB):
+            return []
+        with contextlib.closing(open_db(self.path(DISK_DB).read_bytes())) as database:
+            return [dict(row) for row in database.execute("select * from disk")]
+
+    def db_execute(self, statement, values=()):
+        """Change the database file; the daemon must not be at it meanwhile."""
+        target = self.path(DISK_DB)
+        target.parent.mkdir(parents=True, exist_ok=True)
+        content = target.read_bytes() if target.exists() else b""
+        with contextlib.closing(open_db(content)) as database:
+            with database:
+                database.execute(statement, values)
+            target.write_bytes(database.serialize())

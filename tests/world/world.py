@@ -38,7 +38,7 @@ def _close_all():
         world.close()
 
 
-class World:
+class World(state.Observed):
     """A private router: its own /tmp, /run, /etc, /dev, /sys/block and processes.
 
     tools    "" for the distribution's programs, "busybox" for a static busybox
@@ -268,47 +268,7 @@ class World:
         """Send the message that the web interface sends."""
         self.send("#safe_remove", pipe="safe_remove")
 
-    # What can be seen.
-
-    def mounts(self, under=state.MOUNT_BASE):
-        """The world's mounts at or below a directory, oldest first."""
-        text = Path(f"/proc/{self.keeper_pid}/mounts").read_text()
-        return [entry for entry in state.parse_mounts(text)
-                if entry.path == under or entry.path.startswith(under.rstrip("/") + "/")]
-
-    def mounted(self):
-        """{device path: mount path} below the mount base."""
-        return {entry.dev: entry.path for entry in self.mounts()}
-
-    def disk_json(self):
-        """The published document, None when there is none or half of one."""
-        return state.load_json(self.read(state.DISK_JSON)) if self.exists(state.DISK_JSON) else None
-
-    def parts(self):
-        """Published partitions by device name."""
-        document = self.disk_json()
-        return {part.dev_name: part for part in state.parse_parts(document)} if document else {}
-
-    def disk_num(self):
-        """Text of the count file, None when there is none."""
-        return self.read(state.DISK_NUM) if self.exists(state.DISK_NUM) else None
-
-    def db_rows(self):
-        """Rows of the table "disk" as dicts in stored order; [] without a database."""
-        if not self.exists(state.DISK_DB):
-            return []
-        with contextlib.closing(state.open_db(self.path(state.DISK_DB).read_bytes())) as database:
-            return [dict(row) for row in database.execute("select * from disk")]
-
-    def db_execute(self, statement, values=()):
-        """Change the database file; the daemon must not be at it meanwhile."""
-        target = self.path(state.DISK_DB)
-        target.parent.mkdir(parents=True, exist_ok=True)
-        content = target.read_bytes() if target.exists() else b""
-        with contextlib.closing(state.open_db(content)) as database:
-            with database:
-                database.execute(statement, values)
-            target.write_bytes(database.serialize())
+    # Waiting and outside services.
 
     def wait(self, condition, timeout, what):
         """wait_for, named here since every test needs it."""
@@ -322,8 +282,6 @@ class World:
             lines += [f"--- {daemon.log_path.name}, exit status {daemon.returncode}:",
                       daemon.log()[-12000:]]
         return "\n".join(lines)
-
-    # Outside services.
 
     def syslog(self):
         """Put a /dev/log in place; returns the Syslog that reads it."""
