@@ -1,0 +1,10 @@
+# The few names of OpenWrt's buildroot that a package Makefile uses before it includes anything else.
+INCLUDE_DIR:=$(TOPDIR)/include
+STAGE?=$(TOPDIR)/stage
+PKG_BUILD_DIR=$(STAGE)/build
+PKG_INSTALL_DIR=$(STAGE)/install
+INSTALL_DIR:=install -d -m0755
+INSTALL_BIN:=install -m0755
+INSTALL_DATA:=install -m0644
+CP:=cp -fpR
+qstrip=$(strip $(subst ",,$(1)))

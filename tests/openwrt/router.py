@@ -1,0 +1,136 @@
+"""A router for the package's scripts: a private world with busybox, rc.common and a small procd."""
+
+import shutil
+import subprocess
+from pathlib import Path
+
+from world import World, wait_for
+
+HERE = Path(__file__).resolve().parent
+CHECKOUT = HERE.parents[1]
+PACKAGE = "tarn-nas-diskmanager"
+FEED_DIR = CHECKOUT / "openwrt" / PACKAGE
+INIT = "/etc/init.d/tarn_nas_diskmanager"
+HOTPLUG = "/etc/hotplug.d/block/60-tarn_nas_diskmanager"
+LABEL = "/usr/bin/disk_get_label.sh"
+PROG = "/usr/bin/tarn_nas_diskmanager"
+PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
+PIPE = "/tmp/tarn_nas/pipe_disk_add_remove"
+
+
+class Buildroot:
+    """Runs the package's Makefile with stand-ins for OpenWrt's include files."""
+
+    def __init__(self, directory, program):
+        self.top = Path(directory)
+        shutil.copytree(HERE / "buildroot", self.top)
+        compiled = self.top / "stage/install/usr"
+        (compiled / "bin").mkdir(parents=True)
+        (compiled / "lib").mkdir()
+        shutil.copy(program, compiled / "bin/tarn_nas_diskmanager")
+        library = Path(program).parent / "libtarn-utils.so"
+        if library.exists():
+            shutil.copy(library, compiled / "lib")
+        else:
+            (compiled / "lib/libtarn-utils.so").write_text("")
+
+    def make(self, *words):
+        """Run make on a target of the package; returns what it printed."""
+        return subprocess.run(["make", "-s", "-C", FEED_DIR, f"TOPDIR={self.top}", *words],
+                              check=True, capture_output=True, text=True).stdout
+
+    def show(self, package, *words):
+        """{field: text} of a package."""
+        lines = self.make(f"show-{package}", *words).splitlines()
+        return dict((line + " ").split(" ", 1) for line in lines)
+
+    def install(self, *packages):
+        """Run install sections; returns the root directory that they filled."""
+        self.make(*(f"install-{package}" for package in packages))
+        return self.top / "stage/root"
+
+
+class Router:
+    """A world on which the staged package lies and the scripts run under busybox ash."""
+
+    def __init__(self, root):
+        self.world = World(tools="busybox")
+        # Both directories are the machine's own until an overlay covers them.
+        self.world.label_script("")
+        self._overlay("/usr/lib")
+        for source in sorted(path for path in root.rglob("*") if path.is_file()):
+            target = self.world.path("/" + str(source.relative_to(root)))
+            target.parent.mkdir(parents=True, exist_ok=True)
+            shutil.copy(source, target)
+        self._lay_procd()
+
+    def _lay_procd(self):
+        self.world.write("/etc/rc.common", (HERE / "router/rc.common").read_text(), 0o755)
+        self.world.write("/usr/lib/functions/procd.sh", (HERE / "router/procd.sh").read_text())
+        self.world.write("/usr/lib/procd_supervise", (HERE / "router/procd_supervise").read_text())
+        self.world.write("/run/procd/respawn_delay", "1")
+
+    def _overlay(self, directory):
+        upper = "/run/overlay" + directory
+        self.world.run("mkdir", "-p", f"{upper}/upper", f"{upper}/work")
+        self.world.run("mount", "-t", "overlay", "overlay", directory, "-o",
+                       f"lowerdir={directory},upperdir={upper}/upper,workdir={upper}/work")
+
+    def close(self):
+        self.world.close()
+
+    # The service.
+
+    def service(self, action, timeout=100):
+        """Run the init script; returns its CompletedProcess."""
+        return self.world.run(INIT, action, timeout=timeout)
+
+    def start(self):
+        """Start the service and wait until the daemon has its pipe open."""
+        self.service("start")
+        return self.wait_ready()
+
+    def wait_ready(self, but=()):
+        """Wait for a daemon that is none of `but` and has opened its pipe; returns its pid."""
+        def ready():
+            pids = [pid for pid in self.pids() if pid not in but]
+            return pids and any(PIPE in line for line in self.open_files(pids[0])) and pids[0]
+        return wait_for(ready, 20, "a daemon with an open pipe")
+
+    def pids(self):
+        """Pids of the daemon, as the router sees them."""
+        script = (f'for exe in /proc/[0-9]*/exe; do [ "$(readlink $exe)" = {PROG} ] && echo $exe; done')
+        listed = self.world.sh(script, check=False).stdout.split()
+        return [int(path.split("/")[2]) for path in listed]
+
+    def open_files(self, pid):
+        """Targets of a process's descriptors."""
+        return self.world.sh(f"for fd in /proc/{pid}/fd/*; do readlink $fd; done",
+                             check=False).stdout.split()
+
+    def mode(self, *words):
+        """Make the stand-in difficult; see there."""
+        self.world.write("/tmp/mode", " ".join(words) + "\n")
+
+    def notes(self):
+        """Lines that the stand-in noted."""
+        return self.world.read("/tmp/notes").splitlines() if self.world.exists("/tmp/notes") else []
+
+    def output(self):
+        """What the daemon printed, as procd received it."""
+        return self.world.read("/run/procd/output")
+
+    def procd_calls(self):
+        """Calls of procd's functions so far."""
+        return self.world.read("/run/procd/calls").splitlines()
+
+    # Kernel events.
+
+    def uevent(self, action, name, devtype="partition", timeout=20):
+        """Let a kernel event arrive as hotplug-call hands it on."""
+        self.world.run("env", f"ACTION={action}", f"DEVNAME={name}", f"DEVTYPE={devtype}",
+                       "SUBSYSTEM=block", "/bin/sh", "-c", f"( . {HOTPLUG} )", timeout=timeout)
+
+    def messages(self):
+        """Messages that the stand-in read from its pipe."""
+        return [line for line in self.notes() if line.startswith("#")]

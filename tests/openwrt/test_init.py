@@ -1,0 +1,174 @@
+"""The service script: start, stop and restart of a daemon that ends only at its second SIGINT."""
+
+import time
+
+import pytest
+from router import PID_FILE, PROG
+from world import wait_for
+
+
+def starts(router):
+    return router.notes().count("start")
+
+
+def faults(router):
+    return [call for call in router.procd_calls() if call.startswith("fault")]
+
+
+def test_start_hands_the_daemon_to_procd_with_respawn_and_both_outputs_logged(router):
+    router.start()
+    calls = router.procd_calls()
+    assert f"set_param command {PROG}" in calls
+    assert "set_param respawn" in calls
+    assert "set_param stdout 1" in calls
+    assert "set_param stderr 1" in calls
+
+
+def test_procd_kills_later_than_the_script_does(router):
+    router.start()
+    timeouts = [int(call.split()[-1]) for call in router.procd_calls() if "term_timeout" in call]
+    assert timeouts and timeouts[0] > 65
+
+
+def test_sigterm_alone_does_not_end_the_stand_in(router):
+    pid = router.start()
+    router.world.run("kill", "-TERM", pid)
+    time.sleep(1)
+    assert router.pids() == [pid]
+
+
+def test_stop_ends_the_daemon_in_good_order(router):
+    router.start()
+    began = time.monotonic()
+    router.service("stop")
+    assert time.monotonic() - began < 10
+    assert router.pids() == []
+    assert router.notes()[-1] == "end"
+    assert not router.world.exists(PID_FILE)
+
+
+def test_stop_prints_nothing_and_tells_procd_once(router):
+    router.start()
+    done = router.service("stop")
+    assert done.stdout + done.stderr == ""
+    assert [call for call in router.procd_calls() if call.startswith("kill")] == [
+        "kill tarn_nas_diskmanager"]
+
+
+def test_stop_without_a_daemon_is_quick_and_quiet(router):
+    began = time.monotonic()
+    done = router.service("stop")
+    assert time.monotonic() - began < 3
+    assert done.stdout + done.stderr == ""
+
+
+def test_procd_does_not_start_a_stopped_daemon_again(router):
+    router.world.write("/run/procd/respawn_delay", "0")
+    router.start()
+    router.service("stop")
+    time.sleep(2)
+    assert router.pids() == []
+    assert starts(router) == 1
+
+
+def test_procd_starts_a_crashed_daemon_again(router):
+    pid = router.start()
+    router.world.run("kill", "-KILL", pid)
+    assert router.wait_ready(but=[pid]) != pid
+
+
+def test_stop_repeats_a_sigint_that_a_running_command_swallowed(router):
+    router.mode("busy")
+    router.start()
+    router.service("stop")
+    assert router.notes()[-1] == "end"
+    assert router.pids() == []
+
+
+def test_restart_replaces_the_daemon(router):
+    old = router.start()
+    router.service("restart")
+    assert router.wait_ready(but=[old]) != old
+    assert router.notes() == ["start", "end", "start"]
+    assert faults(router) == []
+
+
+def test_restart_waits_for_a_process_whose_pid_file_is_gone_already(router):
+    router.mode("slow")
+    old = router.start()
+    router.service("restart")
+    router.wait_ready(but=[old])
+    assert router.notes() == ["start", "end", "start"]
+    assert faults(router) == []
+
+
+@pytest.mark.parametrize("mode", ["", "slow"])
+def test_the_daemon_can_restart_itself_on_its_way_out(router, mode):
+    router.mode(mode)
+    old = router.start()
+    router.world.write("/tmp/restart", "")
+    new = router.wait_ready(but=[old])
+    # Long enough for a respawn that procd had in mind.
+    time.sleep(4)
+    assert router.pids() == [new]
+    assert router.notes() == ["start", "end", "start"]
+    assert faults(router) == []
+
+
+def test_a_daemon_that_does_not_end_is_killed_and_its_pid_file_removed(router):
+    syslog = router.world.syslog()
+    router.mode("hang")
+    router.start()
+    began = time.monotonic()
+    router.service("stop")
+    assert 55 < time.monotonic() - began < 80
+    assert router.pids() == []
+    assert not router.world.exists(PID_FILE)
+    syslog.wait_message("killing it", ident="tarn_nas_diskmanager", timeout=5)
+
+
+def test_a_stale_pid_file_does_not_keep_the_daemon_from_starting(router):
+    # A single digit that occurs in any list of pids: without help the daemon gives way to it.
+    router.world.write(PID_FILE, "1")
+    router.service("start")
+    router.wait_ready()
+    assert "gave way" not in router.notes()
+
+
+def test_the_pid_file_of_a_running_daemon_is_left_alone(router):
+    pid = router.start()
+    router.service("start")
+    assert router.world.read(PID_FILE) == str(pid)
+    assert router.pids() == [pid]
+
+
+def test_stop_leaves_other_processes_with_the_name_in_their_command_line_alone(router):
+    router.start()
+    other = router.world.popen("tail", "-f", "/etc/init.d/tarn_nas_diskmanager")
+    router.service("stop")
+    assert other.poll() is None
+    other.kill()
+    other.wait(10)
+
+
+def test_the_real_daemon_starts_stops_and_starts_again(real_router):
+    old = real_router.start()
+    assert real_router.world.read(PID_FILE) == str(old)
+    assert real_router.service("stop").returncode == 0
+    assert real_router.pids() == []
+    assert not real_router.world.exists(PID_FILE)
+    new = real_router.start()
+    real_router.service("restart")
+    assert real_router.wait_ready(but=[new]) != new
+
+
+def test_the_real_daemon_restarts_itself_after_a_failed_consistency_check(real_router):
+    old = real_router.start()
+    # A mount below the mount base whose device does not exist is the broken state that it restarts for.
+    real_router.world.sh("mkdir -p /tmp/mountd/disk1_part1 &&"
+                         " mount -t tmpfs /dev/sdz1 /tmp/mountd/disk1_part1")
+    real_router.uevent("add", "sda", "disk")
+    new = wait_for(lambda: [pid for pid in real_router.pids() if pid != old], 60, "a new daemon")
+    time.sleep(8)
+    assert real_router.pids() == new
+    assert not [call for call in real_router.procd_calls() if call.startswith("fault")]

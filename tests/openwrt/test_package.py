@@ -1,0 +1,82 @@
+"""The feed package: what its Makefile installs, depends on and tells CMake."""
+
+import os
+
+import pytest
+from router import CHECKOUT, FEED_DIR, PACKAGE
+
+EXECUTABLE = ["etc/init.d/tarn_nas_diskmanager", "usr/bin/disk_get_label.sh",
+              "usr/bin/tarn_nas_diskmanager"]
+PLAIN = ["etc/hotplug.d/block/60-tarn_nas_diskmanager", "lib/upgrade/keep.d/tarn-nas-diskmanager",
+         "usr/lib/libtarn-utils.so"]
+LIBRARY = "CONFIG_TARN_NAS_DISKMANAGER_TARN_UTILS_LIBRARY"
+
+
+def files(root):
+    return sorted(str(path.relative_to(root)) for path in root.rglob("*") if path.is_file())
+
+
+def test_every_file_lies_where_the_router_looks_for_it(buildroot):
+    root = buildroot.install(PACKAGE, f"{PACKAGE}-label")
+    assert files(root) == sorted(EXECUTABLE + PLAIN)
+    assert [name for name in EXECUTABLE if not os.access(root / name, os.X_OK)] == []
+
+
+def test_the_label_script_is_a_package_of_its_own(buildroot):
+    assert "usr/bin/disk_get_label.sh" not in files(buildroot.install(PACKAGE))
+    assert "+tarn-nas-diskmanager" in buildroot.show(f"{PACKAGE}-label")["DEPENDS"]
+
+
+def test_the_hotplug_script_has_not_the_name_that_the_daemon_deletes(buildroot):
+    root = buildroot.install(PACKAGE)
+    assert "10-mount" not in os.listdir(root / "etc/hotplug.d/block")
+
+
+@pytest.mark.parametrize("word", [
+    "+libuci", "+libsqlite3", "+cJSON", "+blkid", ":kmod-fs-vfat", ":kmod-nls-utf8", ":kmod-fs-exfat",
+    ":kmod-fs-ext4", ":ntfs-3g", ":kmod-fs-hfsplus", ":kmod-usb-storage"])
+def test_a_dependency_is_named(buildroot, word):
+    depends = buildroot.show(PACKAGE)["DEPENDS"].split()
+    assert [entry for entry in depends if entry.endswith(word)]
+
+
+def test_each_conditional_dependency_has_its_menu_entry(buildroot):
+    menu = (FEED_DIR / "Config.in").read_text()
+    conditions = {entry[1:].split(":")[0] for entry in buildroot.show(PACKAGE)["DEPENDS"].split()
+                  if ":" in entry}
+    assert conditions
+    assert [name for name in conditions if f"config {name}\n" not in menu] == []
+
+
+def test_the_database_survives_an_upgrade(buildroot):
+    root = buildroot.install(PACKAGE)
+    assert buildroot.show(PACKAGE)["CONFFILES"].strip() == "/etc/config/tarn_nas/disk.db"
+    kept = (root / "lib/upgrade/keep.d/tarn-nas-diskmanager").read_text()
+    assert kept == "/etc/config/tarn_nas/\n"
+
+
+def test_the_makers_library_takes_the_place_of_the_stand_in(buildroot):
+    named = f"{LIBRARY}=\"/srv/libtarn-utils.so\""
+    assert "-DTARN_UTILS_LIBRARY=/srv/libtarn-utils.so" in buildroot.show(PACKAGE, named)["CMAKE_OPTIONS"]
+    buildroot.make(f"install-{PACKAGE}", named)
+    assert "usr/lib/libtarn-utils.so" not in files(buildroot.top / "stage/root")
+
+
+def test_cmake_knows_each_option_that_it_is_given(buildroot):
+    known = (CHECKOUT / "CMakeLists.txt").read_text()
+    words = buildroot.show(PACKAGE)["CMAKE_OPTIONS"].split()
+    names = [word[2:].split("=")[0] for word in words]
+    assert len(names) >= 3
+    assert [name for name in names if f"{name} " not in known] == []
+
+
+def test_no_host_is_named_as_the_place_of_the_sources(buildroot):
+    assert buildroot.show(PACKAGE)["SOURCE_URL"].strip() == ""
+    assert "http" not in (FEED_DIR / "Makefile").read_text()
+
+
+def test_the_sources_of_this_tree_are_copied_without_its_builds(buildroot):
+    buildroot.make("prepare")
+    prepared = set(os.listdir(buildroot.top / "stage/build"))
+    assert {"CMakeLists.txt", "cmake", "src", "platform"} <= prepared
+    assert not {"build", ".git", "tests"} & prepared
