@@ -22,15 +22,21 @@ set(CMAKE_SYSTEM_PROCESSOR ${cross_arch})
 function(cross_write_tool name command)
     file(CONFIGURE OUTPUT "${cross_tools}/${name}" @ONLY CONTENT [=[#!/bin/sh
 export ZIG_GLOBAL_CACHE_DIR='@cross_root@/zig-cache' ZIG_LOCAL_CACHE_DIR='@cross_root@/zig-cache'
-# zig does not know this option, and a static program has no table to export into; "-u" keeps the symbol.
+# zig knows more linker options behind "-Wl," than behind "-Xlinker", which CMake uses. It knows none for one exported
+# symbol, and a static program has no table to export into; "-u" keeps the symbol.
+previous=
+linker=
 for arg do
     shift
-    case $arg in
-        -Wl,--export-dynamic-symbol=*) ;;
+    case $previous$arg in
+        -Xlinker | -Xlinker--export-dynamic-symbol=*) ;;
+        -Xlinker*) linker=$linker,$arg ;;
         *) set -- "$@" "$arg" ;;
     esac
+    previous=
+    [ "$arg" != -Xlinker ] || previous=$arg
 done
-exec '@cross_zig@' @command@ "$@"
+exec '@cross_zig@' @command@ "$@" ${linker:+"-Wl$linker"}
 ]=])
     file(CHMOD "${cross_tools}/${name}" PERMISSIONS
         OWNER_READ OWNER_WRITE OWNER_EXECUTE GROUP_READ GROUP_EXECUTE WORLD_READ WORLD_EXECUTE)
