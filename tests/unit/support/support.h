@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 #include <sys/mman.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -14,6 +15,7 @@
 #include <fstream>
 #include <functional>
 #include <iterator>
+#include <regex>
 #include <sstream>
 #include <string>
 #include <string_view>
@@ -88,24 +90,68 @@ inline int count_of(const std::string& text, const std::string& part)
     return count;
 }
 
-// Everything that action and its child processes write to descriptor 1.
-inline std::string capture_stdout(const std::function<void()>& action)
+// A log text with "N" in place of the line numbers: "file.cpp(12)" and "[file.cpp:12]" change with
+// every edit of the daemon.
+inline std::string without_line_numbers(const std::string& text)
 {
-    fflush(stdout);
-    int kept = dup(STDOUT_FILENO);
-    int sink = memfd_create("captured", 0);
+    static const std::regex plain(R"((\.(?:cpp|h))\(\d+\))");
+    static const std::regex bracketed(R"((\.(?:cpp|h)):\d+\])");
+    std::string changed = std::regex_replace(text, plain, "$1(N)");
+    return std::regex_replace(changed, bracketed, "$1:N]");
+}
+
+// Everything that action and its child processes write to the descriptor of stream.
+inline std::string capture(FILE* stream, const std::function<void()>& action)
+{
+    int target = fileno(stream);
+    fflush(stream);
+    int kept = dup(target);
+    int sink = memfd_create("captured", MFD_CLOEXEC);
     EXPECT_NE(sink, -1);
-    dup2(sink, STDOUT_FILENO);
+    dup2(sink, target);
 
     action();
 
-    fflush(stdout);
-    dup2(kept, STDOUT_FILENO);
+    fflush(stream);
+    dup2(kept, target);
     close(kept);
     std::string text(static_cast<size_t>(lseek(sink, 0, SEEK_END)), '\0');
     EXPECT_EQ(pread(sink, text.data(), text.size(), 0), static_cast<ssize_t>(text.size()));
     close(sink);
     return text;
+}
+
+inline std::string capture_stdout(const std::function<void()>& action)
+{
+    return capture(stdout, action);
+}
+
+inline std::string capture_stderr(const std::function<void()>& action)
+{
+    return capture(stderr, action);
+}
+
+// What action writes through the log and its commands, without the line numbers.
+inline std::string log_of(const std::function<void()>& action)
+{
+    return without_line_numbers(capture_stdout(action));
+}
+
+// Runs action in a process of its own, for what a process cannot take back, and returns its result
+// (0 to 127). 255 when it was killed, also because it took longer than half a minute.
+inline int in_child(const std::function<int()>& action)
+{
+    fflush(nullptr);
+    pid_t child = fork();
+    if (child == 0) {
+        alarm(30);
+        int result = action();
+        fflush(nullptr);
+        _exit(result);
+    }
+    int status = 0;
+    EXPECT_EQ(waitpid(child, &status, 0), child);
+    return WIFEXITED(status) ? WEXITSTATUS(status) : 255;
 }
 
 // Programs in front of PATH that stand in for the system's and write down how they are called.
