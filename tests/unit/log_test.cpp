@@ -1,0 +1,447 @@
+#include "log/log.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <ctime>
+
+#include "support/support.h"
+
+using support::capture_stdout;
+using support::in_child;
+
+namespace {
+
+// Through this pointer a test may make up formats of any length.
+void (*const print)(int32_t, const char*, int32_t, const char*, ...) = log_printf;
+
+std::string printed(int32_t level, const char* file, int32_t line, const std::string& fmt)
+{
+    return capture_stdout([&] { print(level, file, line, fmt.c_str()); });
+}
+
+// The receiving end of syslog.
+class syslog_socket {
+public:
+    syslog_socket() : fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0))
+    {
+        support::remove_all("/dev/log");
+        sockaddr_un address{};
+        address.sun_family = AF_UNIX;
+        strcpy(address.sun_path, "/dev/log");
+        EXPECT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+    }
+
+    ~syslog_socket()
+    {
+        close(fd);
+        support::remove_all("/dev/log");
+    }
+
+    syslog_socket(const syslog_socket&) = delete;
+    syslog_socket& operator=(const syslog_socket&) = delete;
+
+    // The next message, empty when none has come. Senders have finished when this is called.
+    [[nodiscard]] std::string next() const
+    {
+        char text[2048];
+        ssize_t length = recv(fd, text, sizeof(text), 0);
+        return length < 0 ? "" : std::string(text, static_cast<size_t>(length));
+    }
+
+private:
+    int fd;
+};
+
+bool ends_with(const std::string& text, const std::string& end)
+{
+    return text.size() >= end.size() &&
+           text.compare(text.size() - end.size(), end.size(), end) == 0;
+}
+
+std::string dated_log_path(time_t when)
+{
+    const tm* date = localtime(&when);
+    std::ostringstream path;
+    path << "/tmp/log/disk_log-" << date->tm_year + 1900 << '-' << date->tm_mon + 1 << '-'
+         << date->tm_mday << '-' << date->tm_hour << '-' << date->tm_min << '-' << date->tm_sec
+         << ".txt";
+    return path.str();
+}
+
+std::vector<std::string> log_files()
+{
+    std::vector<std::string> paths;
+    for (const auto& entry : std::filesystem::directory_iterator("/tmp/log")) {
+        paths.push_back(entry.path());
+    }
+    return paths;
+}
+
+volatile sig_atomic_t sigpipe_count = 0;
+
+void log_the_signal(int signum)
+{
+    sigpipe_count = sigpipe_count + 1;
+    log_info("got signal %d\n", signum);
+}
+
+}  // namespace
+
+TEST(Log, EachLevelHasItsHeader)
+{
+    errno = ENOENT;
+    EXPECT_EQ(printed(LOG_LVL_INFO, "mount.cpp", 12, "hello\n"), "mount.cpp(12)hello\n");
+    EXPECT_EQ(printed(LOG_LVL_WARN, "mount.cpp", 12, "hello\n"), "Warning[mount.cpp:12]hello\n");
+    EXPECT_EQ(printed(LOG_LVL_ERR, "mount.cpp", 12, "hello\n"), "ERROR[mount.cpp:12]hello\n");
+    errno = ENOENT;
+    EXPECT_EQ(printed(LOG_LVL_ERRNO, "mount.cpp", 12, "hello\n"),
+              "ERROR[mount.cpp:12](No such file or directory)hello\n");
+}
+
+TEST(Log, TheLevelsAreNumberedFromOneToFour)
+{
+    EXPECT_EQ(LOG_LVL_INFO, 1);
+    EXPECT_EQ(LOG_LVL_WARN, 2);
+    EXPECT_EQ(LOG_LVL_ERR, 3);
+    EXPECT_EQ(LOG_LVL_ERRNO, 4);
+}
+
+TEST(Log, AnyOtherLevelIsPrintedLikeLevelOne)
+{
+    for (int32_t level : {0, 5, 7, -1, 1000}) {
+        EXPECT_EQ(printed(level, "a.cpp", 3, "x\n"), "a.cpp(3)x\n") << level;
+    }
+}
+
+TEST(Log, OnlyTheBaseNameOfTheFileIsPrinted)
+{
+    EXPECT_EQ(printed(1, "/a/b/c.cpp", 1, "x"), "c.cpp(1)x");
+    EXPECT_EQ(printed(1, "src/disk/mount.cpp", 1, "x"), "mount.cpp(1)x");
+    EXPECT_EQ(printed(1, "plain", 1, "x"), "plain(1)x");
+    EXPECT_EQ(printed(1, "ends/", 1, "x"), "(1)x");
+}
+
+TEST(Log, TheArgumentsFillTheCallersFormat)
+{
+    std::string text = capture_stdout([] {
+        log_printf(LOG_LVL_WARN, "m.cpp", 9, "dev = %s, n = %d, %llu%%\n", "sda1", -5, 1ULL << 40);
+    });
+    EXPECT_EQ(text, "Warning[m.cpp:9]dev = sda1, n = -5, 1099511627776%\n");
+}
+
+TEST(Log, APercentSignInAnArgumentIsPrintedAsItStands)
+{
+    std::string text = capture_stdout([] { log_printf(1, "m.cpp", 9, "label = %s\n", "50%d%s"); });
+    EXPECT_EQ(text, "m.cpp(9)label = 50%d%s\n");
+}
+
+TEST(Log, NoNewlineIsAdded)
+{
+    EXPECT_EQ(printed(1, "m.cpp", 1, "no end"), "m.cpp(1)no end");
+}
+
+TEST(Log, HeaderAndFormatTogetherAreCutAt255Characters)
+{
+    const std::string header = "m.cpp(1)";
+    for (size_t length : {254U, 255U, 256U, 300U}) {
+        std::string fmt(length - header.size(), 'f');
+        std::string expected = (header + fmt).substr(0, 255);
+        EXPECT_EQ(printed(1, "m.cpp", 1, fmt), expected) << length;
+    }
+}
+
+TEST(Log, AConversionBehindTheHeadersCutIsNotMade)
+{
+    const std::string header = "m.cpp(1)";
+    std::string fmt(255 - header.size(), 'f');
+    std::string text = capture_stdout([&] { print(1, "m.cpp", 1, (fmt + "%s").c_str(), "late"); });
+    EXPECT_EQ(text, header + fmt);
+}
+
+TEST(Log, TheMessageIsCutAt511Characters)
+{
+    const std::string header = "m.cpp(1)";
+    for (size_t length : {510U, 511U, 512U, 2000U}) {
+        std::string argument(length - header.size(), 'a');
+        std::string expected = (header + argument).substr(0, 511);
+        std::string text = capture_stdout([&] { print(1, "m.cpp", 1, "%s", argument.c_str()); });
+        EXPECT_EQ(text, expected) << length;
+    }
+}
+
+TEST(Log, TheShortFormsGiveTheirOwnFileAndLine)
+{
+    std::string text = support::log_of([] {
+        errno = EACCES;
+        log_info("1\n");
+        log_warn("2\n");
+        log_err("3\n");
+        log_errno("4\n");
+    });
+    EXPECT_EQ(text, "log_test.cpp(N)1\n"
+                    "Warning[log_test.cpp:N]2\n"
+                    "ERROR[log_test.cpp:N]3\n"
+                    "ERROR[log_test.cpp:N](Permission denied)4\n");
+}
+
+TEST(Log, ErrnoIsKept)
+{
+    for (int32_t level = 1; level <= 4; level++) {
+        capture_stdout([&] {
+            errno = EXDEV;
+            log_printf(level, "m.cpp", 1, "x\n");
+            EXPECT_EQ(errno, EXDEV);
+        });
+    }
+}
+
+TEST(Log, ErrnoIsKeptWhenStandardOutputIsClosed)
+{
+    EXPECT_EQ(in_child([] {
+                  setvbuf(stdout, nullptr, _IONBF, 0);
+                  close(STDOUT_FILENO);
+                  errno = EXDEV;
+                  log_printf(1, "m.cpp", 1, "x\n");
+                  return errno == EXDEV ? 0 : 1;
+              }),
+              0);
+}
+
+TEST(Log, SwitchingTheLogOnLeavesItOn)
+{
+    log_set_debug();
+    EXPECT_EQ(printed(1, "m.cpp", 1, "x\n"), "m.cpp(1)x\n");
+}
+
+TEST(Log, PrintingWithoutHeaderTakesTheFormatAlone)
+{
+    EXPECT_EQ(capture_stdout([] { log_print_stdout("%s(%d)line\n", "a/b.cpp", 7); }),
+              "a/b.cpp(7)line\n");
+}
+
+TEST(Log, AReaderThatWentAwayRaisesNoSignalAndNoLoop)
+{
+    int result = in_child([] {
+        int ends[2];
+        if (pipe(ends) != 0 || dup2(ends[1], STDOUT_FILENO) < 0) {
+            return 2;
+        }
+        close(ends[0]);
+        close(ends[1]);
+        setvbuf(stdout, nullptr, _IOLBF, 0);
+        signal(SIGPIPE, log_the_signal);
+        for (int i = 0; i < 100; i++) {
+            log_info("nobody reads this\n");
+            log_print_stdout("nor this\n");
+        }
+        return sigpipe_count == 0 ? 0 : 1;
+    });
+    EXPECT_EQ(result, 0);
+}
+
+TEST(Log, TheDefaultSigpipeDoesNotEndTheProcess)
+{
+    int result = in_child([] {
+        int ends[2];
+        if (pipe(ends) != 0 || dup2(ends[1], STDOUT_FILENO) < 0) {
+            return 2;
+        }
+        close(ends[0]);
+        setvbuf(stdout, nullptr, _IOLBF, 0);
+        log_info("nobody reads this\n");
+        close(ends[1]);
+        return 0;
+    });
+    EXPECT_EQ(result, 0);
+}
+
+TEST(Log, ASignalPendingForOthersIsDeliveredAfterTheMessage)
+{
+    std::string text = capture_stdout([] {
+        in_child([] {
+            signal(SIGUSR1, [](int) { log_info("from the handler\n"); });
+            setvbuf(stdout, nullptr, _IOLBF, 0);
+            log_info("first\n");
+            raise(SIGUSR1);
+            log_info("last\n");
+            return 0;
+        });
+    });
+    EXPECT_EQ(support::without_line_numbers(text),
+              "log_test.cpp(N)first\nlog_test.cpp(N)from the handler\nlog_test.cpp(N)last\n");
+}
+
+TEST(Log, NothingReachesSyslogBeforeItIsSwitchedOn)
+{
+    syslog_socket sink;
+    printed(LOG_LVL_ERR, "m.cpp", 1, "quiet\n");
+    EXPECT_EQ(sink.next(), "");
+}
+
+TEST(Log, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
+{
+    syslog_socket sink;
+    std::string text = capture_stdout([] {
+        EXPECT_EQ(in_child([] {
+                      log_printf(1, "a/m.cpp", 1, "before\n");
+                      log_enable_syslog();
+                      log_printf(1, "a/m.cpp", 2, "one %d\n", 1);
+                      log_printf(2, "a/m.cpp", 3, "two\n");
+                      log_set_debug();
+                      log_printf(3, "a/m.cpp", 4, "three %s\n", "%d");
+                      errno = ENOENT;
+                      log_printf(4, "a/m.cpp", 5, "four\n");
+                      return errno == ENOENT ? 0 : 1;
+                  }),
+                  0);
+    });
+    const std::vector<std::string> expected = {"m.cpp(2)one 1", "Warning[m.cpp:3]two",
+                                               "ERROR[m.cpp:4]three %d",
+                                               "ERROR[m.cpp:5](No such file or directory)four"};
+    for (const std::string& message : expected) {
+        std::string got = sink.next();
+        // Facility daemon (3) and priority info (6), whatever the level.
+        EXPECT_EQ(got.substr(0, 4), "<30>") << got;
+        while (!got.empty() && (got.back() == '\n' || got.back() == '\0')) {
+            got.pop_back();
+        }
+        EXPECT_TRUE(ends_with(got, " tarndisk: " + message)) << got;
+    }
+    EXPECT_EQ(sink.next(), "");
+    // Standard output goes on as before.
+    EXPECT_EQ(support::lines_of(text).size(), 5U);
+}
+
+TEST(Log, AMissingSyslogDisturbsNothing)
+{
+    support::remove_all("/dev/log");
+    std::string text = capture_stdout([] {
+        EXPECT_EQ(in_child([] {
+                      log_enable_syslog();
+                      errno = EXDEV;
+                      log_printf(1, "m.cpp", 2, "still here\n");
+                      return errno == EXDEV ? 0 : 1;
+                  }),
+                  0);
+    });
+    EXPECT_EQ(text, "m.cpp(2)still here\n");
+}
+
+class LogFile : public testing::Test {
+protected:
+    LogFile() { support::remove_all("/tmp/log"); }
+    ~LogFile() override { support::remove_all("/tmp/log"); }
+};
+
+TEST_F(LogFile, IsNamedAfterTheTimeWithoutLeadingZeros)
+{
+    support::make_dir("/tmp/log");
+    EXPECT_EQ(in_child([] {
+                  time_t before = time(nullptr);
+                  if (log_file_open() != 0) {
+                      return 1;
+                  }
+                  time_t after = time(nullptr);
+                  std::vector<std::string> files = log_files();
+                  if (files.size() != 1) {
+                      return 2;
+                  }
+                  bool named =
+                      files[0] == dated_log_path(before) || files[0] == dated_log_path(after);
+                  return named ? 0 : 3;
+              }),
+              0);
+    EXPECT_EQ(log_files().size(), 1U);
+}
+
+TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
+{
+    std::string text =
+        capture_stdout([] { EXPECT_EQ(in_child([] { return log_file_open(); }), 1); });
+    std::regex line("err, file = /tmp/log/disk_log-[0-9]+(-[0-9]+){5}\\.txt\n");
+    EXPECT_TRUE(std::regex_match(text, line)) << text;
+    EXPECT_FALSE(std::filesystem::exists("/tmp/log"));
+}
+
+TEST_F(LogFile, ClosingAFileThatIsNotOpenSucceeds)
+{
+    EXPECT_EQ(in_child([] { return log_file_close(); }), 0);
+}
+
+TEST_F(LogFile, ClosingAnOpenFileSucceeds)
+{
+    support::make_dir("/tmp/log");
+    EXPECT_EQ(in_child([] { return log_file_open() + log_file_close(); }), 0);
+}
+
+TEST_F(LogFile, MessagesDoNotReachTheFile)
+{
+    support::make_dir("/tmp/log");
+    capture_stdout([] {
+        in_child([] {
+            log_file_open();
+            log_err("for standard output\n");
+            return log_file_close();
+        });
+    });
+    ASSERT_EQ(log_files().size(), 1U);
+    EXPECT_EQ(support::read_file(log_files()[0]), "");
+}
+
+TEST_F(LogFile, WritingOpensTheFileAndStandsInItAtOnce)
+{
+    support::make_dir("/tmp/log");
+    EXPECT_EQ(in_child([] {
+                  if (log_file_write("one\n") != 0 || log_file_write("two") != 0) {
+                      return 1;
+                  }
+                  return support::read_file(log_files().at(0)) == "one\ntwo" ? 0 : 2;
+              }),
+              0);
+}
+
+TEST_F(LogFile, WritingWithoutItsDirectoryIsRefused)
+{
+    capture_stdout([] { EXPECT_EQ(in_child([] { return log_file_write("x\n"); }), 1); });
+}
+
+TEST_F(LogFile, AnExistingFileIsAppendedTo)
+{
+    support::make_dir("/tmp/log");
+    EXPECT_EQ(in_child([] {
+                  time_t now = time(nullptr);
+                  for (time_t t = now; t < now + 30; t++) {
+                      support::write_file(dated_log_path(t), "old\n");
+                  }
+                  return log_file_write("new\n");
+              }),
+              0);
+    int appended = 0;
+    for (const std::string& path : log_files()) {
+        appended += support::read_file(path) == "old\nnew\n" ? 1 : 0;
+    }
+    EXPECT_EQ(appended, 1);
+}
+
+TEST_F(LogFile, The1502ndWriteIsRefusedAndWritesNothing)
+{
+    support::make_dir("/tmp/log");
+    EXPECT_EQ(in_child([] {
+                  for (int i = 1; i <= 1501; i++) {
+                      if (log_file_write("x\n") != 0) {
+                          return 1;
+                      }
+                  }
+                  return log_file_write("y\n") == 1 && log_file_write("y\n") == 1 ? 0 : 2;
+              }),
+              0);
+    ASSERT_EQ(log_files().size(), 1U);
+    std::string text = support::read_file(log_files()[0]);
+    EXPECT_EQ(support::count_of(text, "x\n"), 1501);
+    EXPECT_EQ(support::count_of(text, "y"), 0);
+}
