@@ -1,0 +1,200 @@
+#include "util/exec.h"
+
+#include <dlfcn.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+
+#include <csignal>
+
+#include "support/support.h"
+#include "util/pause.h"
+
+using support::capture_stderr;
+using support::capture_stdout;
+using support::count_of;
+using support::in_child;
+
+namespace {
+
+constexpr const char* KILLS_ITSELF = "kill -KILL $$";
+
+// How often a command is tried that fails every time.
+int tries_for(int attempts)
+{
+    int tries = 0;
+    capture_stderr([&] {
+        std::string text = capture_stdout(
+            [&] { EXPECT_EQ(exec_cmd(KILLS_ITSELF, attempts, "caller.cpp", 1), 1); });
+        tries = count_of(text, "ret = ");
+        EXPECT_EQ(support::lines_of(text).size(), 2U * static_cast<size_t>(tries));
+    });
+    return tries;
+}
+
+volatile sig_atomic_t children_ended = 0;
+
+bool system_fails = false;
+
+void count_child(int)
+{
+    children_ended = children_ended + 1;
+}
+
+}  // namespace
+
+// Stands in front of the C library's, for a machine that can start no process.
+int system(const char* command)
+{
+    static const auto real = reinterpret_cast<int (*)(const char*)>(dlsym(RTLD_NEXT, "system"));
+    return system_fails ? -1 : real(command);
+}
+
+TEST(ExecCmd, AttemptsOutsideOneToNineMeanFive)
+{
+    for (int attempts : {0, 10, -3, 11, 1000}) {
+        EXPECT_EQ(tries_for(attempts), 5) << attempts;
+    }
+}
+
+TEST(ExecCmd, AttemptsFromOneToNineAreTaken)
+{
+    for (int attempts : {1, 2, 5, 8, 9}) {
+        EXPECT_EQ(tries_for(attempts), attempts);
+    }
+}
+
+TEST(ExecCmd, PrintsTheCommandWithTheCallersFileAndLine)
+{
+    std::string text =
+        capture_stdout([] { EXPECT_EQ(exec_cmd("echo done", 1, "src/disk/mount.cpp", 77), 0); });
+    EXPECT_EQ(text, "src/disk/mount.cpp(77)exec cmd = echo done\ndone\n");
+}
+
+TEST(ExecCmd, TakesFileAndLineOfItsCallerByItself)
+{
+    std::string text = capture_stdout([] { exec_cmd("true", 1); });
+    EXPECT_TRUE(std::regex_match(text, std::regex(".*exec_test\\.cpp\\(\\d+\\)exec cmd = true\n")))
+        << text;
+}
+
+TEST(ExecCmd, APercentSignInACommandIsPrintedAsItStands)
+{
+    EXPECT_EQ(capture_stdout([] { exec_cmd("true %s%d", 1, "c.cpp", 1); }),
+              "c.cpp(1)exec cmd = true %s%d\n");
+}
+
+TEST(ExecCmd, AnExitCodeIsNoFailure)
+{
+    for (const char* command :
+         {"false", "exit 1", "exit 127", "exit 255", "no_such_program_here"}) {
+        capture_stderr([&] {
+            std::string text =
+                capture_stdout([&] { EXPECT_EQ(exec_cmd(command, 1, "c.cpp", 1), 0) << command; });
+            EXPECT_EQ(count_of(text, "exec cmd"), 1) << command;
+        });
+    }
+}
+
+TEST(ExecCmd, ACommandKilledByASignalFailsWithTwoLinesPerAttempt)
+{
+    std::string errors;
+    std::string text = capture_stdout([&] {
+        errors = capture_stderr([] { EXPECT_EQ(exec_cmd(KILLS_ITSELF, 2, "c.cpp", 4), 1); });
+    });
+    const std::string pair = "c.cpp(4)exec cmd = kill -KILL $$\n"
+                             "c.cpp(4)exec cmd = kill -KILL $$, ret = 9\n";
+    EXPECT_EQ(text, pair + pair);
+    EXPECT_EQ(count_of(errors, "err:: "), 2) << errors;
+}
+
+TEST(ExecCmd, StopsAtTheFirstSuccess)
+{
+    support::remove_all("/run/tried");
+    const char* fails_once = "test -e /run/tried || { touch /run/tried; kill -KILL $$; }";
+    capture_stderr([&] {
+        std::string text = capture_stdout([&] { EXPECT_EQ(exec_cmd(fails_once, 9, "c", 1), 0); });
+        EXPECT_EQ(count_of(text, "exec cmd"), 3);
+        EXPECT_EQ(count_of(text, ", ret = 9\n"), 1);
+    });
+    support::remove_all("/run/tried");
+}
+
+TEST(ExecCmd, ACommandThatCannotBeStartedFails)
+{
+    std::string text = capture_stdout([] {
+        capture_stderr([] {
+            system_fails = true;
+            EXPECT_EQ(exec_cmd("true", 3, "c.cpp", 1), 1);
+            system_fails = false;
+        });
+    });
+    EXPECT_EQ(count_of(text, "c.cpp(1)exec cmd = true, ret = -1\n"), 3) << text;
+}
+
+TEST(ExecCmd, ItsOutputStandsBeforeThatOfTheCommand)
+{
+    std::string text = capture_stdout([] {
+        printf("earlier\n");
+        exec_cmd("echo now", 1, "c.cpp", 1);
+    });
+    EXPECT_EQ(text, "earlier\nc.cpp(1)exec cmd = echo now\nnow\n");
+}
+
+TEST(RunSystem, GivesTheRawStatus)
+{
+    EXPECT_EQ(run_system("true"), 0);
+    EXPECT_EQ(run_system("exit 3"), 3 << 8);
+    EXPECT_EQ(run_system("kill -TERM $$"), SIGTERM);
+}
+
+TEST(RunSystem, WorksAlsoWhileChildrenAreIgnored)
+{
+    EXPECT_EQ(in_child([] {
+                  signal(SIGCHLD, SIG_IGN);
+                  if (run_system("exit 3") != 3 << 8) {
+                      return 1;
+                  }
+                  return signal(SIGCHLD, SIG_DFL) == SIG_IGN ? 0 : 2;
+              }),
+              0);
+}
+
+TEST(RunSystem, HoldsTheHandlerBackAndPutsItInAgain)
+{
+    EXPECT_EQ(in_child([] {
+                  signal(SIGCHLD, count_child);
+                  run_system("true");
+                  run_system("kill -KILL $$");
+                  if (children_ended != 0) {
+                      return 1;
+                  }
+                  return signal(SIGCHLD, SIG_DFL) == count_child ? 0 : 2;
+              }),
+              0);
+}
+
+TEST(Pause, LastsItsSecondsAlsoWhenSignalsArrive)
+{
+    EXPECT_EQ(in_child([] {
+                  struct sigaction action {};
+                  action.sa_handler = count_child;
+                  sigaction(SIGALRM, &action, nullptr);
+                  const timespec before = [] {
+                      timespec now{};
+                      clock_gettime(CLOCK_MONOTONIC, &now);
+                      return now;
+                  }();
+                  ualarm(100000, 100000);
+                  pause_seconds(1);
+                  ualarm(0, 0);
+                  timespec after{};
+                  clock_gettime(CLOCK_MONOTONIC, &after);
+                  const double passed = static_cast<double>(after.tv_sec - before.tv_sec) +
+                                        static_cast<double>(after.tv_nsec - before.tv_nsec) / 1e9;
+                  if (children_ended < 5) {
+                      return 1;
+                  }
+                  return passed >= 1.0 && passed < 30 ? 0 : 2;
+              }),
+              0);
+}
