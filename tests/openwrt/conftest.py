@@ -1,7 +1,6 @@
 """Fixtures of the package's tests: a router with busybox on which the package is installed."""
 
 import os
-import shutil
 import subprocess
 import sys
 from pathlib import Path
@@ -67,14 +66,3 @@ def real_router(make_router):
 def buildroot(tmp_path, stand_in):
     """A buildroot that takes the stand-in for the compiled daemon."""
     return Buildroot(tmp_path / "buildroot", stand_in)
-
-
-@pytest.fixture
-def tools():
-    """Path look-up of the machine's programs, for tests that need one; skips without it."""
-    def find(name):
-        found = shutil.which(name)
-        if not found:
-            pytest.skip(f"{name} is not installed")
-        return found
-    return find
