@@ -6,8 +6,9 @@ from pathlib import Path
 
 import pytest
 
+from daemon import BINARY, Daemon, pack_daemon
 from disks import DiskBox
-from vm import Vm
+from vm import Vm, VmError
 
 HERE = Path(__file__).resolve().parent
 
@@ -42,3 +43,31 @@ def bare_vm(machine_files):
     """A machine without the daemon."""
     with Vm() as vm:
         yield vm
+
+
+@pytest.fixture(scope="session")
+def daemon_vm(machine_files, tmp_path_factory):
+    """One machine with the release daemon in it for all tests; `daemon` cleans it up between them."""
+    if not BINARY.exists():
+        pytest.skip(f"no daemon: {BINARY} is not built")
+
+    overlay = tmp_path_factory.mktemp("vm") / "daemon.cpio"
+    pack_daemon(overlay)
+
+    with Vm(overlay) as vm:
+        yield vm
+
+
+@pytest.fixture
+def daemon(daemon_vm, box):
+    """The daemon, not yet started, its companion running. What it printed is shown when the test fails."""
+    driver = Daemon(daemon_vm)
+    driver.start_companion()
+    yield driver
+    print(driver.log())
+
+    try:
+        driver.reset()
+    except VmError:
+        daemon_vm.stop()
+        daemon_vm.start()

@@ -18,6 +18,8 @@ class Part:
 MKFS = {
     "vfat": ["mkfs.vfat", "-F", "32", "-n"],
     "exfat": ["mkfs.exfat", "-L"],
+    "ext2": ["mkfs.ext2", "-q", "-F", "-L"],
+    "ext3": ["mkfs.ext3", "-q", "-F", "-L"],
     "ext4": ["mkfs.ext4", "-q", "-F", "-L"],
     "ntfs": ["mkfs.ntfs", "-q", "-F", "-Q", "-L"],
 }
@@ -57,15 +59,14 @@ def make_filesystem(path, part):
 
 
 def table_script(table, parts):
-    mbr = {"vfat": "c", "exfat": "7", "ntfs": "7", "ext4": "83"}
-    gpt = {"vfat": "EBD0A0A2-B9E5-4433-87C0-68B6B72699C7", "exfat": "EBD0A0A2-B9E5-4433-87C0-68B6B72699C7",
-           "ntfs": "EBD0A0A2-B9E5-4433-87C0-68B6B72699C7", "ext4": "0FC63DAF-8483-4772-8E79-3D69D8477DE4"}
-    kinds = gpt if table == "gpt" else mbr
+    mbr = {"vfat": "c", "exfat": "7", "ntfs": "7"}
+    gpt = dict.fromkeys(mbr, "EBD0A0A2-B9E5-4433-87C0-68B6B72699C7")
+    kinds, linux = (gpt, "0FC63DAF-8483-4772-8E79-3D69D8477DE4") if table == "gpt" else (mbr, "83")
     lines = [f"label: {table}"]
     start = 1
 
     for part in parts:
-        lines.append(f"start={start * 2048}, size={part.size_mib * 2048}, type={kinds[part.fs]}")
+        lines.append(f"start={start * 2048}, size={part.size_mib * 2048}, type={kinds.get(part.fs, linux)}")
         start += part.size_mib
 
     return "\n".join(lines) + "\n"

@@ -55,9 +55,9 @@ def test_events_name_the_disk_before_its_partitions_and_after_them(bare_vm, box)
     stick = box.disk("stick", "dos", [Part("vfat", 1100, "ONE"), Part("vfat", 1100, "TWO")])
 
     bare_vm.plug_usb("stick", stick)
-    bare_vm.wait("grep -q sda2 /tmp/uevents")
+    bare_vm.wait("grep -q '^add sda2$' /tmp/uevents")
     bare_vm.pull_usb("stick")
-    bare_vm.wait("grep -q '^#remove_dev:sda$' /tmp/uevents")
+    bare_vm.wait("grep -q '^remove sda$' /tmp/uevents")
 
-    assert bare_vm.check("cat /tmp/uevents").split() == [
-        "#add:sda", "#add:sda1", "#add:sda2", "#remove_dev:sda1", "#remove_dev:sda2", "#remove_dev:sda"]
+    assert bare_vm.check("cat /tmp/uevents").splitlines() == [
+        "add sda", "add sda1", "add sda2", "remove sda1", "remove sda2", "remove sda"]

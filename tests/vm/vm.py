@@ -213,6 +213,12 @@ class Vm:
         """Takes the card out at once."""
         self.monitor.command("eject", id="card", force=True)
 
+    def pull_everything(self):
+        for name in list(self.plugged):
+            self.pull_usb(name)
+
+        self.eject_card()
+
     def _add_image(self, name, image):
         self.monitor.command("blockdev-add", **{
             "node-name": name, "driver": "raw", "discard": "unmap",
@@ -220,8 +226,9 @@ class Vm:
 
     def _command(self):
         initrds = [INITRAMFS]
-        command = ["qemu-system-x86_64", "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot",
-                   "-machine", "q35", "-m", "256", "-smp", "1", "-kernel", str(KERNEL),
+        # A test run that is killed takes its machine along.
+        command = ["setpriv", "--pdeathsig", "KILL", "qemu-system-x86_64",
+                   "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot", "-machine", "q35", "-m", "256", "-smp", "1", "-kernel", str(KERNEL),
                    "-append", "console=ttyS0 quiet loglevel=4 panic=-1 usb_storage.delay_use=0 tsc=reliable"]
         command += ["-accel", self.accelerator, "-cpu", "host" if self.accelerator == "kvm" else "max"]
 
