@@ -1,0 +1,753 @@
+#include "util/file.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "support/support.h"
+
+using support::log_of;
+using support::make_dir;
+using support::read_file;
+using support::write_file;
+
+namespace {
+
+const std::string ROOT = "/run/files";
+
+bool exists(const std::string& path)
+{
+    return std::filesystem::exists(std::filesystem::symlink_status(path));
+}
+
+void make_link(const std::string& target, const std::string& path)
+{
+    ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
+}
+
+// Something that exists and that open refuses, also to root.
+void make_socket(const std::string& path)
+{
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    ASSERT_LT(path.size(), sizeof(address.sun_path));
+    memcpy(address.sun_path, path.c_str(), path.size() + 1);
+    ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+    close(fd);
+}
+
+mode_t mode_of(const std::string& path)
+{
+    struct stat info {};
+    EXPECT_EQ(lstat(path.c_str(), &info), 0) << path;
+    return info.st_mode;
+}
+
+// The content that file_read_all gives, with its terminating zero checked.
+std::string whole_file(const std::string& path)
+{
+    char* content = file_read_all(path.c_str());
+    EXPECT_NE(content, nullptr);
+    if (content == nullptr) {
+        return "";
+    }
+    std::string text(content);
+    free(content);
+    return text;
+}
+
+class Files : public testing::Test {
+protected:
+    Files()
+    {
+        support::remove_all(ROOT);
+        make_dir(ROOT);
+    }
+    ~Files() override { support::remove_all(ROOT); }
+
+    support::kept_working_dir working_dir;
+    const std::string file = ROOT + "/file";
+    const std::string missing = ROOT + "/missing";
+};
+
+using DirHasEntry = Files;
+using FileGetSize = Files;
+using FileWrite = Files;
+using FileAppend = Files;
+using FdReadFull = Files;
+using FileReadAt = Files;
+using FileReadAll = Files;
+using FileReadBuf = Files;
+using FileDelete = Files;
+using Remove = Files;
+using PathGetType = Files;
+using DirMake = Files;
+using PathRemoveTree = Files;
+using FifoCreateOpen = Files;
+
+}  // namespace
+
+TEST_F(DirHasEntry, WantsTheWholeName)
+{
+    make_dir(ROOT + "/sda");
+    write_file(ROOT + "/sdb1", "");
+    EXPECT_EQ(dir_has_entry(ROOT.c_str(), "sda"), 0);
+    EXPECT_EQ(dir_has_entry(ROOT.c_str(), "sdb1"), 0);
+    EXPECT_EQ(dir_has_entry(ROOT.c_str(), "."), 0);
+    for (const char* name : {"sd", "sda1", "SDA", "sdb", "", "sda/"}) {
+        EXPECT_EQ(dir_has_entry(ROOT.c_str(), name), 1) << name;
+    }
+}
+
+TEST_F(DirHasEntry, AMissingDirectoryHasNoneAndIsLogged)
+{
+    std::string log = log_of([&] { EXPECT_EQ(dir_has_entry(missing.c_str(), "sda"), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]open dir err, dir = /run/files/missing\n");
+}
+
+TEST_F(DirHasEntry, ANullArgumentGivesOneSilently)
+{
+    std::string log = log_of([&] {
+        EXPECT_EQ(dir_has_entry(nullptr, "sda"), 1);
+        EXPECT_EQ(dir_has_entry(ROOT.c_str(), nullptr), 1);
+    });
+    EXPECT_EQ(log, "");
+}
+
+TEST_F(DirHasEntry, ClosesTheDirectoryOnBothOutcomes)
+{
+    int before = dup(STDIN_FILENO);
+    close(before);
+    make_dir(ROOT + "/sda");
+    for (int i = 0; i < 10; i++) {
+        dir_has_entry(ROOT.c_str(), "sda");
+        dir_has_entry(ROOT.c_str(), "sdb");
+    }
+    int after = dup(STDIN_FILENO);
+    close(after);
+    EXPECT_EQ(after, before);
+}
+
+TEST_F(FileGetSize, GivesTheSizeAndThatTheFileExists)
+{
+    write_file(file, "12345");
+    uint8_t flag = 7;
+    EXPECT_EQ(file_get_size(file.c_str(), &flag), 5);
+    EXPECT_EQ(flag, 1);
+    EXPECT_EQ(file_get_size(file.c_str(), nullptr), 5);
+}
+
+TEST_F(FileGetSize, CountsPastFourGigabytes)
+{
+    support::image big(5LL << 30, file);
+    EXPECT_EQ(file_get_size(file.c_str(), nullptr), 5LL << 30);
+}
+
+TEST_F(FileGetSize, OfAMissingFileIsZeroWithTheSystemsError)
+{
+    uint8_t flag = 7;
+    std::string log = log_of([&] { EXPECT_EQ(file_get_size(missing.c_str(), &flag), 0); });
+    EXPECT_EQ(flag, 0);
+    EXPECT_EQ(log,
+              "ERROR[file.cpp:N](No such file or directory)stat err, fn = /run/files/missing\n");
+    log_of([&] { EXPECT_EQ(file_get_size(missing.c_str(), nullptr), 0); });
+}
+
+TEST_F(FileWrite, CreatesAndTruncates)
+{
+    EXPECT_EQ(file_write(file.c_str(), "long text", 9), 0);
+    EXPECT_EQ(read_file(file), "long text");
+    EXPECT_EQ(file_write(file.c_str(), "short", 5), 0);
+    EXPECT_EQ(read_file(file), "short");
+    EXPECT_EQ(file_write(file.c_str(), "", 0), 0);
+    EXPECT_EQ(read_file(file), "");
+}
+
+TEST_F(FileWrite, TakesAnyBytesAndAnyLength)
+{
+    std::string bytes(300000, '\0');
+    bytes[1] = '\xff';
+    EXPECT_EQ(file_write(file.c_str(), bytes.data(), static_cast<int32_t>(bytes.size())), 0);
+    EXPECT_EQ(read_file(file), bytes);
+}
+
+TEST_F(FileWrite, AnyOpenFailureIsLoggedInTheSameWords)
+{
+    std::string path = missing + "/file";
+    std::string log = log_of([&] {
+        EXPECT_EQ(file_write(path.c_str(), "x", 1), 1);
+        EXPECT_EQ(file_write(ROOT.c_str(), "x", 1), 1);
+    });
+    EXPECT_EQ(log, "file.cpp(N)file not exist, fn = /run/files/missing/file\n"
+                   "file.cpp(N)file not exist, fn = /run/files\n");
+}
+
+TEST_F(FileWrite, AStreamThatTakesNoMoreBytesIsNoFailure)
+{
+    FILE* full = fopen("/dev/full", "w");
+    ASSERT_NE(full, nullptr);
+    setvbuf(full, nullptr, _IONBF, 0);
+    EXPECT_EQ(stream_write_all(full, "x", 1), 0);
+    fclose(full);
+    std::string bytes(100000, 'x');
+    EXPECT_EQ(file_write("/dev/full", bytes.data(), 100000), 0);
+}
+
+TEST_F(FileWrite, AStreamGetsAllBytes)
+{
+    FILE* stream = fopen(file.c_str(), "w");
+    ASSERT_NE(stream, nullptr);
+    EXPECT_EQ(stream_write_all(stream, "ab", 2), 0);
+    EXPECT_EQ(stream_write_all(stream, "ignored", 0), 0);
+    EXPECT_EQ(stream_write_all(stream, "cd", 2), 0);
+    fclose(stream);
+    EXPECT_EQ(read_file(file), "abcd");
+}
+
+TEST_F(FileAppend, CreatesAndAppends)
+{
+    EXPECT_EQ(file_append(file.c_str(), "one", 3), 0);
+    EXPECT_EQ(file_append(file.c_str(), "two", 3), 0);
+    EXPECT_EQ(read_file(file), "onetwo");
+}
+
+TEST_F(FileAppend, AnOpenFailureIsLogged)
+{
+    std::string log = log_of([&] { EXPECT_EQ(file_append(ROOT.c_str(), "x", 1), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]open err, file = /run/files\n");
+}
+
+TEST_F(FdReadFull, WantsExactlyThatManyBytes)
+{
+    write_file(file, "12345");
+    for (int32_t length : {0, 1, 4, 5, 6}) {
+        char buffer[8] = "#######";
+        int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC);
+        EXPECT_EQ(fd_read_full(fd, buffer, length), length <= 5 ? 0 : 1) << length;
+        EXPECT_EQ(std::string(buffer), std::string("12345").substr(0, length) +
+                                           std::string("#######").substr(length <= 5 ? length : 5));
+        close(fd);
+    }
+}
+
+TEST_F(FdReadFull, GoesOnAfterAShortRead)
+{
+    int ends[2];
+    ASSERT_EQ(pipe(ends), 0);
+    // The second half comes later, from another process.
+    pid_t writer = fork();
+    if (writer == 0) {
+        ssize_t first = write(ends[1], "ab", 2);
+        usleep(50000);
+        ssize_t second = write(ends[1], "cd", 2);
+        _exit(first + second == 4 ? 0 : 1);
+    }
+    close(ends[1]);
+    char buffer[5] = "";
+    EXPECT_EQ(fd_read_full(ends[0], buffer, 4), 0);
+    EXPECT_STREQ(buffer, "abcd");
+    EXPECT_EQ(fd_read_full(ends[0], buffer, 1), 1);
+    close(ends[0]);
+    waitpid(writer, nullptr, 0);
+}
+
+TEST_F(FdReadFull, ABadDescriptorGivesOne)
+{
+    char buffer[4];
+    EXPECT_EQ(fd_read_full(-1, buffer, 4), 1);
+}
+
+TEST_F(FileReadAt, ReadsAtTheOffset)
+{
+    write_file(file, "0123456789");
+    char buffer[4] = "";
+    EXPECT_EQ(file_read_at(file.c_str(), 0, buffer, 3), 0);
+    EXPECT_STREQ(buffer, "012");
+    EXPECT_EQ(file_read_at(file.c_str(), 7, buffer, 3), 0);
+    EXPECT_STREQ(buffer, "789");
+    EXPECT_EQ(file_read_at(file.c_str(), -5, buffer, 3), 0);
+    EXPECT_STREQ(buffer, "012");
+    EXPECT_EQ(read_file(file), "0123456789");
+}
+
+TEST_F(FileReadAt, AMissingPathIsCreatedEmptyWithMode0600AndFailsTheRead)
+{
+    char buffer[4];
+    std::string log = log_of([&] { EXPECT_EQ(file_read_at(missing.c_str(), 0, buffer, 4), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]read err, ret=1, len=4\n");
+    EXPECT_EQ(mode_of(missing), static_cast<mode_t>(S_IFREG | 0600));
+    EXPECT_EQ(read_file(missing), "");
+}
+
+TEST_F(FileReadAt, DataThatEndsEarlyFails)
+{
+    write_file(file, "0123456789");
+    char buffer[8];
+    std::string log = log_of([&] { EXPECT_EQ(file_read_at(file.c_str(), 8, buffer, 3), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]read err, ret=1, len=3\n");
+}
+
+TEST_F(FileReadAt, ANullArgumentOrAFailedOpenIsLogged)
+{
+    char buffer[4];
+    std::string log = log_of([&] {
+        EXPECT_EQ(file_read_at(nullptr, 0, buffer, 4), 1);
+        EXPECT_EQ(file_read_at(missing.c_str(), 0, nullptr, 4), 1);
+        EXPECT_EQ(file_read_at(ROOT.c_str(), 0, buffer, 4), 1);
+    });
+    const std::string line = "ERROR[file.cpp:N]err!\n";
+    EXPECT_EQ(log, line + line + line);
+    EXPECT_FALSE(exists(missing));
+}
+
+TEST_F(FileReadAt, ASeekThatFailsIsLogged)
+{
+    ASSERT_EQ(mkfifo(file.c_str(), 0600), 0);
+    char buffer[4];
+    std::string log = log_of([&] { EXPECT_EQ(file_read_at(file.c_str(), 1, buffer, 4), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]seek err!\n");
+}
+
+TEST_F(FileReadAll, GivesTheContentWithATerminatingZero)
+{
+    write_file(file, "line one\nline two\n");
+    EXPECT_EQ(whole_file(file), "line one\nline two\n");
+}
+
+TEST_F(FileReadAll, AnEmptyFileGivesTheTerminatingZeroAlone)
+{
+    write_file(file, "");
+    char* content = file_read_all(file.c_str());
+    ASSERT_NE(content, nullptr);
+    EXPECT_EQ(content[0], '\0');
+    free(content);
+}
+
+TEST_F(FileReadAll, TakesExactly8388607Bytes)
+{
+    for (off_t size : {8388606, 8388607}) {
+        support::image big(size, file);
+        big.write_at(size - 1, "z");
+        char* content = file_read_all(file.c_str());
+        ASSERT_NE(content, nullptr) << size;
+        EXPECT_EQ(content[size - 1], 'z');
+        EXPECT_EQ(content[size], '\0');
+        free(content);
+    }
+}
+
+TEST_F(FileReadAll, RefusesMoreThan8388607Bytes)
+{
+    for (off_t size : {8388608LL, 5LL << 30}) {
+        support::image big(size, file);
+        std::string log = log_of([&] { EXPECT_EQ(file_read_all(file.c_str()), nullptr); });
+        EXPECT_EQ(log, "file.cpp(N)===== file too large =====\n") << size;
+    }
+}
+
+TEST_F(FileReadAll, AMissingFileGivesNothing)
+{
+    std::string log = log_of([&] { EXPECT_EQ(file_read_all(missing.c_str()), nullptr); });
+    EXPECT_EQ(log, "file.cpp(N)file not exist, file = /run/files/missing\n");
+}
+
+TEST_F(FileReadAll, AFileThatCannotBeOpenedGivesNothing)
+{
+    make_socket(file);
+    std::string log = log_of([&] { EXPECT_EQ(file_read_all(file.c_str()), nullptr); });
+    EXPECT_EQ(log, "file.cpp(N)open file err, file = /run/files/file\n");
+}
+
+TEST_F(FileReadAll, AShortReadGivesNothing)
+{
+    // A directory has a size and no bytes to read.
+    write_file(ROOT + "/dir/entry", "");
+    std::string path = ROOT + "/dir";
+    struct stat info {};
+    ASSERT_EQ(stat(path.c_str(), &info), 0);
+    ASSERT_GT(info.st_size, 0);
+    std::string log = log_of([&] { EXPECT_EQ(file_read_all(path.c_str()), nullptr); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]err, fn = /run/files/dir, ret = 1, file_size = " +
+                       std::to_string(info.st_size) + "\n");
+}
+
+TEST_F(FileReadAll, ClosesTheFile)
+{
+    write_file(file, "x");
+    int before = dup(STDIN_FILENO);
+    close(before);
+    for (int i = 0; i < 10; i++) {
+        whole_file(file);
+    }
+    int after = dup(STDIN_FILENO);
+    close(after);
+    EXPECT_EQ(after, before);
+}
+
+TEST_F(FileReadBuf, FillsTheBufferAndLeavesNoZeroFromItsSizeOn)
+{
+    for (int length : {7, 8, 9}) {
+        write_file(file, std::string("123456789").substr(0, length));
+        char buffer[10];
+        memset(buffer, '#', sizeof(buffer));
+        EXPECT_EQ(file_read_buf(file.c_str(), buffer, 8), 0);
+        EXPECT_EQ(std::string(buffer, 8), length == 7 ? std::string("1234567\0", 8) : "12345678");
+        EXPECT_EQ(buffer[8], '#') << length;
+    }
+}
+
+TEST_F(FileReadBuf, ZeroFillsTheBufferFirst)
+{
+    write_file(file, "ab");
+    char buffer[8];
+    memset(buffer, '#', sizeof(buffer));
+    EXPECT_EQ(file_read_buf(file.c_str(), buffer, sizeof(buffer)), 0);
+    EXPECT_EQ(std::string(buffer, sizeof(buffer)), std::string("ab\0\0\0\0\0\0", 8));
+}
+
+TEST_F(FileReadBuf, AMissingFileLeavesTheBufferAlone)
+{
+    char buffer[4] = "old";
+    std::string log = log_of([&] { EXPECT_EQ(file_read_buf(missing.c_str(), buffer, 4), 1); });
+    EXPECT_EQ(log, "file.cpp(N)file not exist, file = /run/files/missing\n");
+    EXPECT_STREQ(buffer, "old");
+}
+
+TEST_F(FileReadBuf, AFileThatCannotBeOpenedIsLogged)
+{
+    make_socket(file);
+    char buffer[4] = "old";
+    std::string log = log_of([&] { EXPECT_EQ(file_read_buf(file.c_str(), buffer, 4), 1); });
+    EXPECT_EQ(log, "file.cpp(N)open file err, file = /run/files/file\n");
+    EXPECT_STREQ(buffer, "");
+}
+
+TEST_F(FileDelete, TakesTheFileAway)
+{
+    write_file(file, "x");
+    std::string log = log_of([&] { EXPECT_EQ(file_delete(file.c_str()), 0); });
+    EXPECT_EQ(log, "");
+    EXPECT_FALSE(exists(file));
+}
+
+TEST_F(FileDelete, AMissingFileGivesOneAndTheWarning)
+{
+    std::string log = log_of([&] { EXPECT_EQ(file_delete(missing.c_str()), 1); });
+    EXPECT_EQ(log, "Warning[file.cpp:N]del err! not exist file = /run/files/missing\n");
+}
+
+TEST_F(FileDelete, AFailedRemovalGivesTheSystemsError)
+{
+    write_file(ROOT + "/dir/entry", "");
+    std::string path = ROOT + "/dir";
+    std::string log = log_of([&] { EXPECT_EQ(file_delete(path.c_str()), 1); });
+    EXPECT_EQ(log,
+              "ERROR[file.cpp:N](Directory not empty)remove file err, file = /run/files/dir\n");
+    EXPECT_TRUE(exists(path));
+}
+
+TEST_F(FileDelete, ANullPathGivesOneSilently)
+{
+    std::string log = log_of([] { EXPECT_EQ(file_delete(nullptr), 1); });
+    EXPECT_EQ(log, "");
+}
+
+TEST_F(Remove, RmRfTakesAWholeTreeInDoubleQuotes)
+{
+    std::string path = ROOT + "/with space";
+    write_file(path + "/deep/file", "x");
+    write_file(path + "/.hidden", "x");
+    write_file(ROOT + "/with", "stays");
+    std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 0); });
+    EXPECT_EQ(support::count_of(log, "exec cmd = rm -rf \"/run/files/with space\"\n"), 1) << log;
+    EXPECT_FALSE(exists(path));
+    EXPECT_TRUE(exists(ROOT + "/with"));
+}
+
+TEST_F(Remove, RmRfTakesAPathOfAnyLength)
+{
+    std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
+    make_dir(path);
+    log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 0); });
+    EXPECT_FALSE(exists(path));
+}
+
+TEST_F(Remove, RmRfWhoseCommandIsKilledGivesOne)
+{
+    // The shell itself is killed: the path ends the quotes.
+    std::string path = ROOT + "/x\"; kill -KILL $$; \"";
+    support::capture_stderr([&] {
+        std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 1); });
+        std::string last = support::lines_of(log).back();
+        EXPECT_EQ(last.substr(0, 17), "ERROR[file.cpp:N]") << log;
+        EXPECT_TRUE(support::contains(last, ")rm err, fn = " + path)) << log;
+    });
+}
+
+TEST_F(Remove, AFileGoesWithoutACommand)
+{
+    write_file(file, "x");
+    std::string log = log_of([&] { EXPECT_EQ(file_remove_retry(file.c_str()), 0); });
+    EXPECT_EQ(log, "");
+    EXPECT_FALSE(exists(file));
+}
+
+TEST_F(Remove, AFileThatStaysIsRemovedByRmRf)
+{
+    write_file(ROOT + "/dir/entry", "");
+    std::string path = ROOT + "/dir";
+    std::string log = log_of([&] { EXPECT_EQ(file_remove_retry(path.c_str()), 0); });
+    EXPECT_EQ(support::count_of(log, "exec cmd = rm -rf \"/run/files/dir\"\n"), 1) << log;
+    EXPECT_FALSE(exists(path));
+}
+
+TEST_F(Remove, AnEmptyDirectoryGoes)
+{
+    std::string path = ROOT + "/dir";
+    make_dir(path);
+    EXPECT_EQ(dir_remove_retry(path.c_str()), 0);
+    EXPECT_FALSE(exists(path));
+}
+
+TEST_F(Remove, ADirectoryThatIsNotEmptyStays)
+{
+    write_file(ROOT + "/dir/entry", "");
+    std::string path = ROOT + "/dir";
+    std::string log = log_of([&] { EXPECT_EQ(dir_remove_retry(path.c_str()), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N](Directory not empty)rm err, fn = /run/files/dir\n");
+    EXPECT_TRUE(exists(ROOT + "/dir/entry"));
+}
+
+TEST_F(Remove, ALinkGoesAndItsTargetStays)
+{
+    write_file(file, "x");
+    std::string link = ROOT + "/link";
+    make_link(file, link);
+    EXPECT_EQ(link_remove_retry(link.c_str()), 0);
+    EXPECT_FALSE(exists(link));
+    EXPECT_TRUE(exists(file));
+}
+
+TEST_F(Remove, AMissingLinkGivesTheSystemsError)
+{
+    std::string log = log_of([&] { EXPECT_EQ(link_remove_retry(missing.c_str()), 1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N](No such file or directory)rm err, fn = /run/files/missing\n");
+}
+
+TEST_F(PathGetType, TellsDirectoriesFilesLinksAndTheRest)
+{
+    write_file(file, "");
+    ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
+    make_socket(ROOT + "/socket");
+    make_link(ROOT, ROOT + "/dir_link");
+    make_link(missing, ROOT + "/dead_link");
+    struct {
+        std::string path;
+        int expected;
+    } cases[] = {
+        {ROOT, 1},
+        {file, 2},
+        {ROOT + "/dir_link", 3},
+        {ROOT + "/dead_link", 3},
+        {ROOT + "/fifo", 0},
+        {ROOT + "/socket", 0},
+        {"/dev/null", 0},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(path_get_type(c.path.c_str()), c.expected) << c.path;
+    }
+}
+
+TEST_F(PathGetType, AMissingPathIsAnErrorWithTheSystemsText)
+{
+    std::string log = log_of([&] { EXPECT_EQ(path_get_type(missing.c_str()), -1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N](No such file or directory)file not exist, file = "
+                   "/run/files/missing\n");
+}
+
+TEST_F(PathGetType, ANullPathIsAnError)
+{
+    std::string log = log_of([] { EXPECT_EQ(path_get_type(nullptr), -1); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N]err!\n");
+}
+
+TEST_F(DirMake, MakesTheDirectoriesAbove)
+{
+    std::string path = ROOT + "/a b/c";
+    std::string log = log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 0); });
+    EXPECT_EQ(support::count_of(log, "exec cmd = mkdir -p '/run/files/a b/c'\n"), 1) << log;
+    EXPECT_TRUE(std::filesystem::is_directory(path));
+}
+
+TEST_F(DirMake, AnExistingDirectoryRunsNothing)
+{
+    std::string log = log_of([] { EXPECT_EQ(dir_make(ROOT.c_str()), 0); });
+    EXPECT_EQ(log, "");
+}
+
+TEST_F(DirMake, OnAnExistingRegularFileIsASuccessAndMakesNothing)
+{
+    write_file(file, "content");
+    std::string log = log_of([&] { EXPECT_EQ(dir_make(file.c_str()), 0); });
+    EXPECT_EQ(log, "");
+    EXPECT_EQ(read_file(file), "content");
+}
+
+TEST_F(DirMake, TakesAPathOfAnyLength)
+{
+    std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
+    log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 0); });
+    EXPECT_TRUE(std::filesystem::is_directory(path));
+}
+
+TEST_F(DirMake, FailsWhenItsCommandCannotRunToItsEnd)
+{
+    // The shell itself is killed: the path ends the quotes.
+    std::string path = ROOT + "/x' ; kill -KILL $$ ; '";
+    support::capture_stderr([&] { log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 1); }); });
+}
+
+TEST_F(PathRemoveTree, TakesAFileALinkAndATree)
+{
+    write_file(ROOT + "/tree/file", "x");
+    write_file(ROOT + "/tree/deep/deeper/file", "x");
+    make_link(missing, ROOT + "/tree/dead_link");
+    write_file(file, "x");
+    make_link(file, ROOT + "/link");
+    EXPECT_EQ(path_remove_tree((ROOT + "/link").c_str()), 0);
+    EXPECT_EQ(path_remove_tree(file.c_str()), 0);
+    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
+    EXPECT_TRUE(std::filesystem::is_empty(ROOT));
+}
+
+TEST_F(PathRemoveTree, LeavesHiddenFilesAndTheirDirectoryAndStillGivesZero)
+{
+    write_file(ROOT + "/tree/.hidden", "x");
+    write_file(ROOT + "/tree/seen", "x");
+    std::string log = log_of([] { EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0); });
+    EXPECT_EQ(log, "ERROR[file.cpp:N](Directory not empty)rm err, fn = /run/files/tree\n");
+    EXPECT_TRUE(exists(ROOT + "/tree/.hidden"));
+    EXPECT_FALSE(exists(ROOT + "/tree/seen"));
+}
+
+TEST_F(PathRemoveTree, LeavesAHiddenDirectory)
+{
+    write_file(ROOT + "/tree/..dir/file", "x");
+    log_of([] { EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0); });
+    EXPECT_TRUE(exists(ROOT + "/tree/..dir/file"));
+}
+
+TEST_F(PathRemoveTree, ALinkToADirectoryIsUnlinkedAndItsTargetStays)
+{
+    write_file(ROOT + "/target/file", "x");
+    std::string link = ROOT + "/link";
+    make_link(ROOT + "/target", link);
+    EXPECT_EQ(path_remove_tree(link.c_str()), 0);
+    EXPECT_FALSE(exists(link));
+    EXPECT_TRUE(exists(ROOT + "/target/file"));
+}
+
+TEST_F(PathRemoveTree, ALinkInsideATreeIsNotFollowed)
+{
+    write_file(ROOT + "/target/file", "x");
+    make_dir(ROOT + "/tree");
+    make_link(ROOT + "/target", ROOT + "/tree/link");
+    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
+    EXPECT_FALSE(exists(ROOT + "/tree"));
+    EXPECT_TRUE(exists(ROOT + "/target/file"));
+}
+
+TEST_F(PathRemoveTree, LeavesTheWorkingDirectoryInTheParent)
+{
+    write_file(ROOT + "/tree/deep/file", "x");
+    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
+    EXPECT_EQ(std::filesystem::current_path(), ROOT);
+}
+
+TEST_F(PathRemoveTree, ARelativePathOfTwoNamesLeavesItsEmptyDirectory)
+{
+    // The directory is removed by the path as it was given, from inside its parent.
+    write_file(ROOT + "/tree/deep/file", "x");
+    ASSERT_EQ(chdir(ROOT.c_str()), 0);
+    log_of([] { EXPECT_EQ(path_remove_tree("tree/deep"), 0); });
+    EXPECT_EQ(std::filesystem::current_path(), ROOT + "/tree");
+    EXPECT_TRUE(std::filesystem::is_empty(ROOT + "/tree/deep"));
+}
+
+TEST_F(PathRemoveTree, WhatIsNeitherFileLinkNorDirectoryIsRefused)
+{
+    ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
+    EXPECT_EQ(path_remove_tree((ROOT + "/fifo").c_str()), 1);
+    EXPECT_TRUE(exists(ROOT + "/fifo"));
+    log_of([&] {
+        EXPECT_EQ(path_remove_tree(missing.c_str()), 1);
+        EXPECT_EQ(path_remove_tree(nullptr), 1);
+    });
+}
+
+TEST_F(FifoCreateOpen, MakesThePipeForItsOwnerAlone)
+{
+    std::string path = ROOT + "/fifo";
+    int fd = fifo_create_open(path.c_str());
+    ASSERT_GE(fd, 0);
+    EXPECT_EQ(mode_of(path), static_cast<mode_t>(S_IFIFO | 0600));
+    close(fd);
+}
+
+TEST_F(FifoCreateOpen, OpensForReadingAndWritingWithoutBlocking)
+{
+    std::string path = ROOT + "/fifo";
+    int fd = fifo_create_open(path.c_str());
+    ASSERT_GE(fd, 0);
+    int flags = fcntl(fd, F_GETFL);
+    EXPECT_EQ(flags & O_ACCMODE, O_RDWR);
+    EXPECT_NE(flags & O_NONBLOCK, 0);
+
+    char buffer[4];
+    EXPECT_EQ(read(fd, buffer, sizeof(buffer)), -1);
+    EXPECT_EQ(errno, EAGAIN);
+
+    int writer = open(path.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC);
+    EXPECT_EQ(write(writer, "abc", 3), 3);
+    close(writer);
+    EXPECT_EQ(read(fd, buffer, sizeof(buffer)), 3);
+    // With the last writer gone there is still no end-of-file.
+    EXPECT_EQ(read(fd, buffer, sizeof(buffer)), -1);
+    EXPECT_EQ(errno, EAGAIN);
+    close(fd);
+}
+
+TEST_F(FifoCreateOpen, TakesWhateverExistsAtThePath)
+{
+    write_file(file, "plain");
+    int fd = fifo_create_open(file.c_str());
+    EXPECT_GE(fd, 0);
+    EXPECT_TRUE(S_ISREG(mode_of(file)));
+    EXPECT_EQ(read_file(file), "plain");
+    close(fd);
+}
+
+TEST_F(FifoCreateOpen, FailuresGiveMinusOneAndTheSystemsError)
+{
+    std::string path = missing + "/fifo";
+    std::string log = log_of([&] {
+        EXPECT_EQ(fifo_create_open(path.c_str()), -1);
+        EXPECT_EQ(fifo_create_open(ROOT.c_str()), -1);
+    });
+    EXPECT_EQ(log, "ERROR[file.cpp:N](No such file or directory)mknod err:"
+                   "ERROR[file.cpp:N](Is a directory)fopen err:");
+}
+
+TEST_F(Files, PathExistsTellsWhatIsThere)
+{
+    write_file(file, "");
+    make_link(missing, ROOT + "/dead_link");
+    EXPECT_TRUE(path_exists(file.c_str()));
+    EXPECT_TRUE(path_exists(ROOT.c_str()));
+    EXPECT_FALSE(path_exists(missing.c_str()));
+    EXPECT_FALSE(path_exists((ROOT + "/dead_link").c_str()));
+}
