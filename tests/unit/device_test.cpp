@@ -1,0 +1,139 @@
+#include "util/device.h"
+
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+#include "support/support.h"
+
+using support::contains;
+using support::log_of;
+using support::write_file;
+
+namespace {
+
+using lines = std::vector<std::string>;
+
+// The platform library's answers, as its stand-in reads them.
+class Device : public testing::Test {
+protected:
+    Device() { clear(); }
+    ~Device() override { clear(); }
+
+    const std::string model_file = "/tmp/sysinfo/model";
+    const std::string sdcard_file = "/etc/tarn_utils/sdcard_point";
+
+private:
+    void clear() const
+    {
+        support::remove_all(model_file);
+        support::remove_all(sdcard_file);
+    }
+};
+
+}  // namespace
+
+TEST_F(Device, TheModelIsCutToItsBuffer)
+{
+    struct {
+        const char* model;
+        const char* expected;
+    } cases[] = {
+        {"TARN-7", "TARN-7"},
+        {"TARN-70", "TARN-70"},
+        {"TARN-700", "TARN-70"},
+        {"TARN-7000 rev B", "TARN-70"},
+    };
+    for (const auto& c : cases) {
+        write_file(model_file, std::string(c.model) + "\n");
+        char out[9] = "########";
+        std::string log = log_of([&] { EXPECT_EQ(device_get_model(out, 8), 0); });
+        EXPECT_STREQ(out, c.expected);
+        EXPECT_EQ(log, std::string("device.cpp(N)get model = ") + c.expected + "\n");
+    }
+}
+
+TEST_F(Device, TheBufferBehindTheModelIsZeroFilled)
+{
+    write_file(model_file, "AB\n");
+    char out[9] = "########";
+    log_of([&] { device_get_model(out, 8); });
+    EXPECT_EQ(std::string(out, 8), std::string("AB\0\0\0\0\0\0", 8));
+}
+
+TEST_F(Device, WithoutAModelTheQueryFails)
+{
+    char out[8] = "old";
+    std::string log = log_of([&] { EXPECT_EQ(device_get_model(out, sizeof(out)), 1); });
+    EXPECT_EQ(log, "ERROR[device.cpp:N]err!\n");
+}
+
+TEST_F(Device, EveryModelPassesTheCheck)
+{
+    log_of([] { EXPECT_EQ(device_model_check(), 1); });
+    write_file(model_file, "a model text of more than thirty-two characters\n");
+    std::string log = log_of([] { EXPECT_EQ(device_model_check(), 1); });
+    EXPECT_EQ(log, "device.cpp(N)get model = a model text of more than thirt\n");
+}
+
+TEST_F(Device, TheSdcardPointIsTheLibrarysText)
+{
+    write_file(sdcard_file, "1-1.4\n");
+    char out[16];
+    memset(out, '#', sizeof(out));
+    std::string log = log_of([&] { EXPECT_EQ(device_get_sdcard_point(out, sizeof(out)), 0); });
+    EXPECT_EQ(std::string(out, 16), std::string("1-1.4") + std::string(11, '\0'));
+    EXPECT_EQ(log, "device.cpp(N)get sdcard point = 1-1.4\n");
+}
+
+TEST_F(Device, ARouterWithoutAnSdcardSlotGivesAnEmptyPoint)
+{
+    char out[16];
+    memset(out, '#', sizeof(out));
+    std::string log = log_of([&] { EXPECT_EQ(device_get_sdcard_point(out, sizeof(out)), 0); });
+    EXPECT_EQ(std::string(out, 16), std::string(16, '\0'));
+    EXPECT_EQ(log, "device.cpp(N)get sdcard point = \n");
+}
+
+TEST_F(Device, AMissingBufferForTheSdcardPointFails)
+{
+    std::string log = log_of([] { EXPECT_EQ(device_get_sdcard_point(nullptr, 16), 1); });
+    EXPECT_EQ(log, "ERROR[device.cpp:N]err!\n");
+}
+
+TEST(Firewall, IsReloadedByItsInitScript)
+{
+    support::stub_programs stubs;
+    stubs.add_at("/etc/init.d/firewall", "echo noise >&2; exit 1");
+    std::string errors = support::capture_stderr([] {
+        std::string log = log_of([] { EXPECT_EQ(firewall_reload(), 0); });
+        EXPECT_TRUE(contains(log, "exec cmd = /etc/init.d/firewall reload 2>/dev/null\n")) << log;
+    });
+    EXPECT_EQ(stubs.calls(), lines{"/etc/init.d/firewall reload"});
+    EXPECT_EQ(errors, "");
+}
+
+TEST(Firewall, AMissingInitScriptIsNoFailure)
+{
+    support::remove_all("/etc/init.d/firewall");
+    log_of([] { EXPECT_EQ(firewall_reload(), 0); });
+}
+
+TEST(SambaShare, IsPointedAtTheMountBaseAndSambaRestarted)
+{
+    support::stub_programs stubs;
+    stubs.add("uci", "exit 1");
+    stubs.add_at("/etc/init.d/samba", "exit 1");
+    std::string log = log_of([] { EXPECT_EQ(samba_share_mountd(), 0); });
+    EXPECT_EQ(stubs.calls(), (lines{"uci set samba.@sambashare[-1].path=/tmp/mountd", "uci commit",
+                                    "/etc/init.d/samba restart"}));
+    EXPECT_TRUE(contains(log, "exec cmd = uci set samba.@sambashare[-1].path=\"/tmp/mountd\"\n"))
+        << log;
+    EXPECT_TRUE(contains(log, "exec cmd = uci commit\n")) << log;
+    EXPECT_TRUE(contains(log, "exec cmd = /etc/init.d/samba restart\n")) << log;
+}
+
+TEST(InitHook, DoesNothing)
+{
+    EXPECT_EQ(log_of([] { EXPECT_EQ(init_hook(), 0); }), "");
+}

@@ -1,0 +1,167 @@
+#include "util/mount_cmd.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+
+#include "support/support.h"
+
+using support::contains;
+using support::log_of;
+
+namespace {
+
+using lines = std::vector<std::string>;
+
+std::string filled_in(const char* format, const char* device, const char* directory)
+{
+    char command[128];
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"
+    snprintf(command, sizeof(command), format, device, directory);
+#pragma GCC diagnostic pop
+    return command;
+}
+
+}  // namespace
+
+TEST(MountCommand, EachFilesystemHasItsOwn)
+{
+    struct {
+        int32_t fs_type;
+        const char* format;
+    } cases[] = {
+        {10, "mount -t exfat %s %s"},
+        {5, "mount -t vfat -o rw,uid=1000,gid=1000,iocharset=utf8 %s %s"},
+        {11, "mount -t ext4 -o rw,defaults %s %s"},
+        {4, "mount -t ext3 -o rw,defaults %s %s"},
+        {3, "mount -t ext2 -o rw,defaults %s %s"},
+        {6, "mount -t hfsplus -o rw,defaults,uid=1000,gid=1000 %s %s"},
+        {8, "mount.ntfs-3g -o noatime,big_writes,async,force %s %s"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_STREQ(fs_mount_cmd_format(c.fs_type), c.format);
+    }
+}
+
+TEST(MountCommand, PartitionTablesAndUnknownTypesHaveNone)
+{
+    for (int32_t fs_type : {9, 7, 2, 1, 0, 12, -1, 100, INT32_MAX, INT32_MIN}) {
+        EXPECT_EQ(fs_mount_cmd_format(fs_type), nullptr) << fs_type;
+    }
+}
+
+TEST(MountCommand, OnlyNtfsRunsItsOwnProgramWithoutATypeOption)
+{
+    for (int32_t fs_type : {3, 4, 5, 6, 10, 11}) {
+        EXPECT_EQ(std::string(fs_mount_cmd_format(fs_type)).rfind("mount -t ", 0), 0U) << fs_type;
+    }
+    std::string ntfs = fs_mount_cmd_format(8);
+    EXPECT_EQ(ntfs.rfind("mount.ntfs-3g ", 0), 0U);
+    EXPECT_FALSE(contains(ntfs, " -t "));
+}
+
+TEST(MountCommand, ASpaceInAnArgumentMakesTwoShellWords)
+{
+    support::stub_programs stubs;
+    stubs.add("mount", "echo $# >/run/words");
+    std::string plain = filled_in(fs_mount_cmd_format(10), "/dev/sda1", "/tmp/mountd/a");
+    std::string spaced = filled_in(fs_mount_cmd_format(10), "/dev/sda1", "/tmp/mountd/a b");
+    ASSERT_EQ(system(plain.c_str()), 0);
+    EXPECT_EQ(support::read_file("/run/words"), "4\n");
+    ASSERT_EQ(system(spaced.c_str()), 0);
+    EXPECT_EQ(support::read_file("/run/words"), "5\n");
+    support::remove_all("/run/words");
+}
+
+TEST(RepairCommand, EachFamilyRunsItsChecker)
+{
+    struct {
+        int (*repair)(const char*);
+        const char* command;
+    } cases[] = {
+        {fs_repair_ntfs, "ntfsfix /dev/sda1"},      {fs_repair_exfat, "fsck.exfat /dev/sda1"},
+        {fs_repair_ext2, "fsck.ext2 -a /dev/sda1"}, {fs_repair_ext3, "fsck.ext3 -a /dev/sda1"},
+        {fs_repair_ext4, "fsck.ext4 -a /dev/sda1"}, {fs_repair_fat, "fsck.fat -a /dev/sda1"},
+    };
+    for (const auto& c : cases) {
+        support::stub_programs stubs;
+        for (const char* name :
+             {"ntfsfix", "fsck.exfat", "fsck.ext2", "fsck.ext3", "fsck.ext4", "fsck.fat"}) {
+            stubs.add(name, "exit 8");
+        }
+        std::string log = log_of([&] { EXPECT_EQ(c.repair("/dev/sda1"), 0); });
+        EXPECT_EQ(stubs.calls(), lines{c.command});
+        EXPECT_TRUE(contains(log, std::string("exec cmd = ") + c.command + "\n")) << log;
+    }
+}
+
+TEST(RepairCommand, ACommandThatIsKilledIsTriedOnceAndGivesZero)
+{
+    support::stub_programs stubs;
+    stubs.add("ntfsfix");
+    support::capture_stderr(
+        [&] { log_of([&] { EXPECT_EQ(fs_repair_ntfs("x; kill -KILL $$"), 0); }); });
+    EXPECT_EQ(stubs.calls(), lines{"ntfsfix x"});
+}
+
+TEST(RepairCommand, IsCutAt127Characters)
+{
+    for (size_t length : {118U, 119U, 120U}) {
+        support::stub_programs stubs;
+        stubs.add("ntfsfix");
+        std::string path(length, 'a');
+        log_of([&] { fs_repair_ntfs(path.c_str()); });
+        EXPECT_EQ(stubs.calls(), lines{("ntfsfix " + path).substr(0, 127)});
+    }
+}
+
+class UmountDirEntries : public testing::Test {
+protected:
+    UmountDirEntries()
+    {
+        support::remove_all(dir);
+        stubs.add("umount", "exit 32");
+    }
+    ~UmountDirEntries() override { support::remove_all(dir); }
+
+    support::stub_programs stubs;
+    const std::string dir = "/tmp/mountd";
+};
+
+TEST_F(UmountDirEntries, UnmountsEveryEntryThatIsNotHidden)
+{
+    support::make_dir(dir + "/disk1_part1");
+    support::make_dir(dir + "/disk2_part1");
+    support::make_dir(dir + "/.hidden");
+    support::make_dir(dir + "/..more");
+    std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 0); });
+    lines calls = stubs.calls();
+    std::sort(calls.begin(), calls.end());
+    EXPECT_EQ(calls, (lines{"umount /tmp/mountd/disk1_part1", "umount /tmp/mountd/disk2_part1"}));
+    EXPECT_TRUE(contains(log, "exec cmd = umount /tmp/mountd/disk1_part1\n")) << log;
+}
+
+TEST_F(UmountDirEntries, OfAnEmptyDirectoryRunsNothing)
+{
+    support::make_dir(dir);
+    std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 0); });
+    EXPECT_EQ(log, "");
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
+TEST_F(UmountDirEntries, OfAMissingDirectoryFails)
+{
+    std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 1); });
+    EXPECT_EQ(log, "ERROR[mount_cmd.cpp:N]open dir err, dir = /tmp/mountd\n");
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
+TEST_F(UmountDirEntries, CutsItsCommandAt255Characters)
+{
+    // "umount /tmp/mountd/" is 19 characters.
+    std::string name(250, 'a');
+    support::make_dir(dir + "/" + name);
+    log_of([&] { umount_dir_entries(dir.c_str()); });
+    EXPECT_EQ(stubs.calls(), lines{"umount /tmp/mountd/" + name.substr(0, 236)});
+}
