@@ -6,6 +6,7 @@ import shutil
 import subprocess
 import tempfile
 import time
+from contextlib import contextmanager
 from pathlib import Path
 
 from vm import ROOT, VmError
@@ -21,6 +22,8 @@ PIPE = "/tmp/tarn_nas/pipe_disk_add_remove"
 PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
 DATABASE = "/etc/config/tarn_nas/disk.db"
 MOUNTS = "/tmp/mountd"
+
+REMOVED_DISK = "^remove \\(sd[a-z]*\\|mmcblk[0-9]*\\)$"
 
 STOPPED = ["samba4 stop", "nas_samba3 stop", "tarn_nas_sys_dl stop", "tarn_nas_sys_up stop"]
 STARTED = ["samba4 start", "nas_samba3 start", "tarn_nas_sys_dl start", "tarn_nas_sys_up start"]
@@ -68,8 +71,7 @@ class Daemon:
 
     def interrupt(self):
         """Interrupts the wait for events: while the daemon runs a command, the C library ignores the signal."""
-        self.wait_listening()
-        self.vm.check(f"kill -INT $(cat {PID_FILE})")
+        self._signal_listening("INT")
 
     def stop(self):
         """Ends the daemon as its start script does and returns its exit status."""
@@ -78,22 +80,26 @@ class Daemon:
         self.interrupt()
         return int(self.vm.wait("cat /tmp/daemon.status", SETTLE_LIMIT))
 
-    def wait_listening(self):
-        """Waits until the daemon has done its periodic work and just begun to wait for events.
+    @contextmanager
+    def held(self):
+        """Holds the daemon in its wait for events, so that it is told of a pulled disk before it looks for itself.
 
-        A disk that is pulled between the rescan and the check of the mounts counts as a broken state, which restarts
-        the daemon. It takes a moment every eight seconds, and would hit a test now and then.
+        A disk that is gone after the rescan and before the check of the mounts behind it counts as a broken state,
+        which restarts the daemon. That moment comes every eight seconds and would hit a test now and then.
         """
-        self.vm.wait(f"grep -q select /proc/$(cat {PID_FILE})/wchan && "
-                     "[ $(($(date +%s) - $(stat -c %Y /tmp/daemon.log))) -le 1 ]")
+        self._signal_listening("STOP")
+        removed = self._removed_disks()
+        yield
+        self.vm.wait(f"[ $(grep -c '{REMOVED_DISK}' /tmp/uevents) -gt {removed} ]")
+        self.vm.check(f"kill -CONT $(cat {PID_FILE})")
 
     def pull_usb(self, name):
-        self.wait_listening()
-        self.vm.pull_usb(name)
+        with self.held():
+            self.vm.pull_usb(name)
 
     def eject_card(self):
-        self.wait_listening()
-        self.vm.eject_card()
+        with self.held():
+            self.vm.eject_card()
 
     def send(self, message):
         self.vm.check(f"echo '{message}' >{PIPE}")
@@ -144,6 +150,12 @@ class Daemon:
                 raise VmError(f"expected {expected}, published {self.places()}, mounted {self.mounts()}")
 
             time.sleep(0.2)
+
+    def _signal_listening(self, signal):
+        self.vm.wait(f"pid=$(cat {PID_FILE}) && grep -q select /proc/$pid/wchan && kill -{signal} $pid")
+
+    def _removed_disks(self):
+        return int(self.vm.run(f"grep -c '{REMOVED_DISK}' /tmp/uevents 2>/dev/null").output or 0)
 
     def reset(self):
         """Leaves the machine as if just booted, for the next test; fails when that cannot be done."""
