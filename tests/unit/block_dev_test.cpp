@@ -280,9 +280,7 @@ TEST(PathGetSpace, CountsTheBlocksReservedForTheSuperuserAsFree)
     support::image disk(16 << 20, "/run/space.img");
     disk.make_fs("mkfs.ext4 -q -F -m 20");
     make_dir("/run/space");
-    if (system("mount -o loop /run/space.img /run/space 2>/dev/null") != 0) {
-        GTEST_SKIP() << "this machine cannot mount an image";
-    }
+    ASSERT_EQ(system("mount -o loop /run/space.img /run/space"), 0);
     struct statvfs info {};
     EXPECT_EQ(statvfs("/run/space", &info), 0);
     uint64_t total = 0;
