@@ -115,7 +115,7 @@ int db_bind_text(sqlite_handle* handle, int index, const char* text)
     return code == SQLITE_OK ? 0 : log_code_and_error(handle, code);
 }
 
-int db_step_count(sqlite_handle* handle, int* value)
+int db_step_is_one(sqlite_handle* handle)
 {
     int code = sqlite3_step(handle->stmt);
     if (code != SQLITE_ROW && code != SQLITE_DONE) {
@@ -123,15 +123,15 @@ int db_step_count(sqlite_handle* handle, int* value)
         db_finalize(handle);
         return -1;
     }
-    const int has_row = code == SQLITE_ROW ? 1 : 0;
     const int columns = sqlite3_column_count(handle->stmt);
+    int value = 0;
     for (; code == SQLITE_ROW; code = sqlite3_step(handle->stmt)) {
         for (int i = 0; i < columns; ++i) {
-            *value = sqlite3_column_int(handle->stmt, i);
+            value = sqlite3_column_int(handle->stmt, i);
         }
     }
     db_finalize(handle);
-    return has_row;
+    return value == 1 ? 1 : 0;
 }
 
 int db_step_done(sqlite_handle* handle)
@@ -157,12 +157,11 @@ int db_table_exists(sqlite_handle* handle, const char* table)
         log_err("err!\n");
         return -1;
     }
-    int count = 0;
-    const int has_row = db_step_count(handle, &count);
-    if (has_row < 0) {
+    const int found = db_step_is_one(handle);
+    if (found < 0) {
         return -1;
     }
-    return has_row == 1 && count == 1 ? 0 : 1;
+    return found == 1 ? 0 : 1;
 }
 
 void db_log_error(sqlite_handle* handle)

@@ -30,9 +30,9 @@ int db_prepare(sqlite_handle* handle, const char* sql);
 // Binds text to the statement's parameter number index (from 1). text must outlive the statement.
 int db_bind_text(sqlite_handle* handle, int index, const char* text);
 
-// Runs the prepared statement and finalizes it in every case. 1 when it gave a row, and the last
-// integer of its last row in value; 0 when it gave none; -1 on error.
-int db_step_count(sqlite_handle* handle, int* value);
+// Runs the prepared statement and finalizes it in every case. 1 when the last integer of its last
+// row is exactly 1, 0 when it is not or there is no row, -1 on error.
+int db_step_is_one(sqlite_handle* handle);
 
 // Runs a prepared statement that gives no rows, and finalizes it in every case.
 int db_step_done(sqlite_handle* handle);

@@ -204,12 +204,7 @@ int disk_table_uid_exists(const char* uid, sqlite_handle* handle)
         log_err("err!\n");
         return -1;
     }
-    int count = 0;
-    const int has_row = db_step_count(handle, &count);
-    if (has_row < 0) {
-        return -1;
-    }
-    return has_row == 1 && count == 1 ? 1 : 0;
+    return db_step_is_one(handle);
 }
 
 int disk_table_select(const char* uid, disk_db_record* record, sqlite_handle* handle)
