@@ -136,12 +136,15 @@ int db_step_is_one(sqlite_handle* handle)
 
 int db_step_done(sqlite_handle* handle)
 {
-    const int code = sqlite3_step(handle->stmt);
-    if (code != SQLITE_DONE) {
-        log_code_and_error(handle, code);
+    const bool done = sqlite3_step(handle->stmt) == SQLITE_DONE;
+    // The step itself only says that something failed; finalizing tells what.
+    sqlite3_finalize(handle->stmt);
+    handle->stmt = nullptr;
+    if (!done) {
+        log_err("err str = %s\n", sqlite3_errmsg(handle->db));
+        db_log_error(handle);
     }
-    db_finalize(handle);
-    return code == SQLITE_DONE ? 0 : 1;
+    return done ? 0 : 1;
 }
 
 int db_table_exists(sqlite_handle* handle, const char* table)

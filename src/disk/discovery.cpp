@@ -86,7 +86,7 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
     }
     if (sys_block_has_dev(dev_name) != 0) {
         disk_sets_add_part(sets, dev_name);
-    } else {
+    } else if (dev_name_is_disk(dev_name) == 0) {
         disk_sets_add_disk(sets, dev_name);
     }
     return 0;
@@ -160,6 +160,9 @@ int dev_check_blkid(const char* dev_name)
 
 void disk_obj_scan_parts(disk_obj* disk)
 {
+    if (disk == nullptr) {
+        return;
+    }
     char path[PATH_SIZE];
     path_sys_disk(path, sizeof(path), disk->root.dev_name);
     log_info("check path = %s\n", path);
@@ -177,6 +180,9 @@ void disk_obj_scan_parts(disk_obj* disk)
 
 void disk_obj_detect_sd_card(disk_obj* disk)
 {
+    if (disk == nullptr) {
+        return;
+    }
     if (text_has_prefix(disk->root.dev_name, "mmcblk")) {
         disk->sd_card = 1;
         return;

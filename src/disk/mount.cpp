@@ -16,7 +16,6 @@
 
 namespace {
 
-constexpr size_t DEV_PATH_SIZE = 64;
 constexpr int32_t ROOT_PART_NUMBER = 1;
 
 // Proposes the directory that the part's numbers stand for.
@@ -75,7 +74,8 @@ void store_new_row(const part_info* part)
     disk_db_add(&record);
 }
 
-// Another device sits in the remembered directory: the part keeps its new one.
+// Another device sits in the remembered directory, or no directory of ours is remembered: the part
+// keeps its new one.
 void overwrite_row(disk_db_record* record, const part_info* part)
 {
     log_info("=== ===> update uid = %s, mount = %s\n", part->uid, part->mount_path);
@@ -213,7 +213,7 @@ void sync_part_with_db(part_info* part)
         store_new_row(part);
         return;
     }
-    if (is_path_mounted(record.mount_path) == 1) {
+    if (!mount_path_is_usable(record.mount_path) || is_path_mounted(record.mount_path) == 1) {
         overwrite_row(&record, part);
         return;
     }

@@ -11,7 +11,9 @@
 namespace {
 
 constexpr int32_t NUMBER_CANDIDATES = 16;
-constexpr size_t UMOUNT_COMMAND_SIZE = 160;  // holds any path of the mount table whole
+constexpr size_t FORCED_UMOUNT_SIZE = 160;  // holds any path of the mount table whole
+
+static_assert(PART_MOUNT_PATH_SIZE == MOUNT_PATH_SIZE, "a listed path fits the record");
 
 bool number_is_mounted(const mount_table* table, int32_t number)
 {
@@ -80,7 +82,7 @@ void log_mount(const mount_entry* entry)
 
 void umount_force(const char* target)
 {
-    char command[UMOUNT_COMMAND_SIZE];
+    char command[FORCED_UMOUNT_SIZE];
     text_format(command, sizeof(command), "umount -f %s", target);
     exec_cmd(command, 1);
 }
@@ -141,6 +143,9 @@ int set_all_mount_point_num(disk_sets* sets)
 
 void number_sub_parts(disk_obj* disk)
 {
+    if (disk == nullptr) {
+        return;
+    }
     const int32_t first = disk->root.fs_type != FS_NONE ? 2 : 1;
     for (int i = 0; i < MAX_SUB_PARTS; ++i) {
         if (disk->parts[i].in_use == 1) {

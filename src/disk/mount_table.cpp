@@ -96,8 +96,8 @@ void parse_mount_point_num(const char* path, int32_t* main_number, int32_t* sub_
         log_err("err str = %s\n", rest);
         return;
     }
-    const int32_t main_value = atoi(main_text);
-    const int32_t sub_value = atoi(sub_text);
+    const auto main_value = static_cast<int32_t>(strtol(main_text, nullptr, 10));
+    const auto sub_value = static_cast<int32_t>(strtol(sub_text, nullptr, 10));
     if (main_number != nullptr) {
         *main_number = main_value;
     }

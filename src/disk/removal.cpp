@@ -14,8 +14,6 @@
 
 namespace {
 
-constexpr size_t DEV_PATH_SIZE = 64;
-
 void run_umount(const char* target)
 {
     char command[COMMAND_SIZE];

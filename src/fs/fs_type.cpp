@@ -16,7 +16,6 @@
 
 namespace {
 
-constexpr size_t DEV_PATH_SIZE = 64;
 constexpr size_t TYPE_PREFIX_LENGTH = 4;
 constexpr char TYPE_KEY[] = "TYPE=";
 constexpr char RULE[] = "==========================\n";
@@ -116,16 +115,15 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
         return 1;
     }
     // The first match wins, also inside PTTYPE or SEC_TYPE.
-    const char* match = strstr(text, TYPE_KEY);
-    if (match != nullptr) {
-        const size_t key_length = strlen(TYPE_KEY);
-        const char* value = strlen(match) > key_length ? match + key_length + 1 : "";
+    const char* value = text_quoted_value(text, TYPE_KEY);
+    const bool found = value != nullptr;
+    if (found) {
         text_copy_n(out, size, value, strcspn(value, "\""));
         log_info("dev = %s, get type = %s\n", dev_path, out);
     }
     free(text);
     file_delete(SCRATCH_BLKID_TYPE);
-    return match != nullptr ? 0 : 1;
+    return found ? 0 : 1;
 }
 
 int dev_has_fs_type(const char* dev_name)

@@ -150,7 +150,7 @@ int log_file_open()
              date.tm_mon + 1, date.tm_mday, date.tm_hour, date.tm_min, date.tm_sec);
     log_fp = fopen(path, "at+");
     if (log_fp == nullptr) {
-        printf("err, file = %s\n", path);
+        log_print_stdout("err, file = %s\n", path);
         return 1;
     }
     // The services that this daemon starts must not keep its log file open.

@@ -12,6 +12,9 @@
 
 namespace {
 
+// What a pipe holds. A writer that never ends its line must not keep the loop for ever.
+constexpr uint32_t PIPE_CAPACITY = 65536;
+
 struct event_kind {
     event_code code;
     const char* keyword;
@@ -56,7 +59,7 @@ int read_message(int fd, char* buffer, uint32_t size)
 {
     uint32_t stored = 0;
     char c = 0;
-    while (read(fd, &c, 1) == 1) {
+    for (uint32_t taken = 0; taken < PIPE_CAPACITY && read(fd, &c, 1) == 1; ++taken) {
         if (stored < size - 1) {
             buffer[stored++] = c;
         }

@@ -126,8 +126,9 @@ void publish_when_due(disk_manager* manager, time_t now)
 // starts again with a fresh database.
 void check_mount_consistency()
 {
-    const bool broken = check_mount_path_dup() != 0 || check_mount_dev_exist() != 0;
-    if (!broken) {
+    const int path_twice = check_mount_path_dup();
+    const int dev_gone = check_mount_dev_exist();
+    if (path_twice == 0 && dev_gone == 0) {
         return;
     }
     file_delete(DISK_DB_FILE);

@@ -41,12 +41,6 @@ uint64_t to_number(const char* text)
     return static_cast<uint64_t>(atoll(text));
 }
 
-// The value starts behind the opening quote; a text that ends at the key has an empty one.
-const char* value_start(const char* match, size_t key_length)
-{
-    return strlen(match) > key_length ? match + key_length + 1 : "";
-}
-
 void query_blkid(const char* command, const char* dev_name, const char* key, char* out, size_t size)
 {
     memset(out, 0, size);
@@ -54,9 +48,8 @@ void query_blkid(const char* command, const char* dev_name, const char* key, cha
 
     char* text = file_read_all(SCRATCH_BLKID_VALUE);
     // The key matches anywhere, so a longer key that ends the same and stands first wins.
-    const char* match = text != nullptr ? strstr(text, key) : nullptr;
-    if (match != nullptr) {
-        const char* value = value_start(match, strlen(key));
+    const char* value = text != nullptr ? text_quoted_value(text, key) : nullptr;
+    if (value != nullptr) {
         const size_t length = strcspn(value, "\" ");
         memcpy(out, value, length < size ? length : size);
         log_info("get %s, %s = %.*s\n", dev_name, key, static_cast<int>(size), out);

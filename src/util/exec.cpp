@@ -16,8 +16,6 @@ constexpr int TERMINATED_BY_SIGNAL_MASK = 0x7F;
 
 int run_system(const char* command)
 {
-    // What we printed stands before what the command prints.
-    fflush(stdout);
     const auto previous = signal(SIGCHLD, SIG_DFL);
     const int status = system(command);
     if (previous != SIG_ERR) {

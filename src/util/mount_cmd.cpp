@@ -11,7 +11,7 @@
 
 namespace {
 
-constexpr size_t UMOUNT_COMMAND_SIZE = 256;
+constexpr size_t UMOUNT_ENTRY_SIZE = 256;
 
 struct mount_cmd {
     int32_t fs_type;
@@ -90,7 +90,7 @@ int umount_dir_entries(const char* path)
         if (name[0] == '.') {
             continue;
         }
-        char command[UMOUNT_COMMAND_SIZE];
+        char command[UMOUNT_ENTRY_SIZE];
         text_format(command, sizeof(command), "umount %s/%s", path, name);
         exec_cmd(command, 1);
     }

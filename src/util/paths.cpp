@@ -65,6 +65,15 @@ int mount_path_to_name(const char* mount_path, char* out, size_t size)
     return 0;
 }
 
+bool mount_path_is_usable(const char* path)
+{
+    if (!text_has_prefix(path, MOUNT_BASE) || path[MOUNT_BASE_LENGTH] != '/') {
+        return false;
+    }
+    const char* name = path + MOUNT_BASE_LENGTH + 1;
+    return name[0] != '\0' && name[0] != '.' && dev_name_is_shell_safe(name);
+}
+
 bool dev_name_is_shell_safe(const char* name)
 {
     return name[strspn(name, DEV_NAME_CHARACTERS)] == '\0';

@@ -1,10 +1,11 @@
-// Every path of the daemon, and every name derived from another, is made here.
+// Every path of the daemon but the log's, and every name derived from another, is made here.
 #pragma once
 
 #include <cstddef>
 #include <cstdint>
 
 constexpr size_t PATH_SIZE = 128;     // buffers for paths below the fixed directories
+constexpr size_t DEV_PATH_SIZE = 64;  // buffers for "/dev/%s" of a record's device name
 constexpr size_t COMMAND_SIZE = 128;  // buffers for shell commands; longer ones are cut
 
 // What other programs see. The doubled slashes belong to the names.
@@ -57,6 +58,10 @@ void path_mount_dir(char* out, size_t size, const char* mount_name);
 // The directory name out of a mount path: drops as many characters as the mount base has, without
 // comparing them, and one slash behind. 0, or 1 for a null argument or a path shorter than that.
 int mount_path_to_name(const char* mount_path, char* out, size_t size);
+
+// True when path is a directory directly below the mount base whose name has only the characters
+// below: what the daemon itself once chose, and not what a damaged database says.
+bool mount_path_is_usable(const char* path);
 
 // True when name holds nothing but what kernel device names are made of: letters, digits, and the
 // characters . _ - and !. Only such a name may become part of a shell command.

@@ -15,6 +15,10 @@ void text_format(char* out, size_t size, const char* fmt, ...)
 
 bool text_has_prefix(const char* text, const char* prefix);
 
+// The value behind the first occurrence of key and the quote that follows it; empty when the text
+// ends at the key, null when the key does not occur.
+const char* text_quoted_value(const char* text, const char* key);
+
 // 0 when both have the same length and the same bytes, else 1.
 int str_equal(const char* a, const char* b);
 
