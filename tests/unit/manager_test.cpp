@@ -1,0 +1,596 @@
+#include "manager/manager.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <ctime>
+#include <string>
+
+#include "disk/disk_db.h"
+#include "support_disk/disk_world.h"
+#include "util/fs_code.h"
+
+using support::capture_stdout;
+using support::contains;
+using support::read_file;
+using support::write_file;
+using support_disk::expect_in_child;
+using support_disk::fake_clock;
+using support_disk::the_clock;
+
+// In front of the C library's, for every test of this program.
+extern "C" time_t time(time_t* out) noexcept
+{
+    timespec now{};
+    clock_gettime(CLOCK_REALTIME, &now);
+    time_t result = now.tv_sec;
+    if (the_clock.fake) {
+        ++the_clock.looks;
+        if (the_clock.on_look) {
+            the_clock.on_look(the_clock.looks);
+        }
+        result = the_clock.now;
+        the_clock.now += the_clock.step;
+    }
+    if (out != nullptr) {
+        *out = result;
+    }
+    return result;
+}
+
+extern "C" int nanosleep(const timespec* duration, timespec* rest)
+{
+    if (!the_clock.skip_sleeps) {
+        return clock_nanosleep(CLOCK_MONOTONIC, 0, duration, rest) == 0 ? 0 : -1;
+    }
+    the_clock.slept += duration->tv_sec;
+    if (the_clock.on_sleep) {
+        the_clock.on_sleep();
+    }
+    return 0;
+}
+
+namespace {
+
+constexpr time_t NOW = 1000000;
+constexpr char EMPTY_JSON[] = "{\"disk_number\": 0, \"disk\": []}";
+constexpr char TABLE_DETAILS[] = R"(PTUUID="12345678" PTTYPE="dos")";
+
+const std::vector<std::string> STOP_CALLS = {
+    "/etc/init.d/samba4 stop", "/etc/init.d/nas_samba3 stop", "/etc/init.d/tarn_nas_sys_dl stop",
+    "/etc/init.d/tarn_nas_sys_up stop"};
+const std::vector<std::string> START_CALLS = {
+    "/etc/init.d/samba4 start", "/etc/init.d/nas_samba3 start", "/etc/init.d/tarn_nas_sys_dl start",
+    "/etc/init.d/tarn_nas_sys_up start"};
+
+std::vector<std::string> joined(const std::vector<std::vector<std::string>>& lists)
+{
+    std::vector<std::string> all;
+    for (const auto& list : lists) {
+        all.insert(all.end(), list.begin(), list.end());
+    }
+    return all;
+}
+
+class Manager : public support_disk::disk_world {
+protected:
+    Manager() : manager(manager_get()) { EXPECT_EQ(manager_init(manager), 0); }
+    ~Manager() override { manager_free(manager); }
+
+    // Larger than what is free in the directories of this world, which are not really mounted.
+    void plug_with_part(const std::string& disk, uint64_t mib)
+    {
+        plug_disk(disk, TABLE_DETAILS, mib + 1);
+        plug_part(disk, disk + "1", "UUID=\"U-" + disk + R"(" TYPE="ext4")", mib);
+    }
+
+    int dispatch(int32_t type, const char* name)
+    {
+        manager->pipes.event = {};
+        manager->pipes.event.type = type;
+        text_copy(manager->pipes.event.dev_name, name);
+        return manager_dispatch(manager);
+    }
+
+    static void send(const char* message)
+    {
+        const int fd = open(PIPE_ADD_REMOVE, O_WRONLY | O_NONBLOCK | O_CLOEXEC);
+        ASSERT_GE(fd, 0);
+        EXPECT_EQ(write(fd, message, strlen(message)), static_cast<ssize_t>(strlen(message)));
+        close(fd);
+    }
+
+    // An active manager whose timers were all set just now.
+    void make_calm()
+    {
+        manager->state = MANAGER_ACTIVE;
+        manager->t_refresh = NOW;
+        manager->t_update = NOW;
+        manager->t_publish = NOW;
+        manager->t_rescan = NOW;
+        write_file(DISK_JSON_FILE, "old");
+    }
+
+    fake_clock clock{NOW};
+    disk_manager* manager;
+};
+
+}  // namespace
+
+TEST_F(Manager, initialising_zeroes_everything_and_opens_the_pipes)
+{
+    manager_free(manager);
+    memset(&manager->disks, 'x', sizeof(manager->disks));
+    manager->t_rescan = 5;
+    manager->update_due = 1;
+    ASSERT_EQ(manager_init(manager), 0);
+    EXPECT_EQ(manager->state, 1);
+    EXPECT_TRUE(support_disk::is_all_zero(manager->disks));
+    EXPECT_EQ(manager->t_rescan, 0);
+    EXPECT_EQ(manager->update_due, 0);
+    EXPECT_GT(manager->pipes.fd_add_remove, 0);
+}
+
+TEST_F(Manager, initialising_fails_when_the_pipes_cannot_be_made)
+{
+    manager_free(manager);
+    support::remove_all("/tmp/tarn_nas");
+    write_file("/tmp/tarn_nas", "");
+    EXPECT_EQ(manager_init(manager), 1);
+    EXPECT_EQ(manager->state, 0);
+    support::remove_all("/tmp/tarn_nas");
+}
+
+TEST_F(Manager, a_null_manager_is_answered_with_1)
+{
+    EXPECT_NE(manager_get(), nullptr);
+    EXPECT_EQ(manager_init(nullptr), 1);
+    EXPECT_EQ(manager_free(nullptr), 1);
+    EXPECT_EQ(manager_scan(nullptr, 0), 1);
+    EXPECT_EQ(manager_run(nullptr), 1);
+    EXPECT_EQ(manager_event_loop(nullptr), 1);
+    EXPECT_EQ(manager_dispatch(nullptr), 1);
+    EXPECT_EQ(manager_idle(nullptr), 1);
+}
+
+TEST_F(Manager, a_start_without_disks_writes_the_empty_document_and_leaves_the_count_alone)
+{
+    write_file(DISK_NUM_FILE, "old");
+    for (const char* name : {"loop0", "mtdblock3", "sr0", "ram0"}) {
+        plug_disk(name, TABLE_DETAILS, 5000);
+    }
+    const std::string log = capture_stdout([&] { EXPECT_EQ(manager_scan(manager, 0), 0); });
+    EXPECT_EQ(read_file("/tmp/tarn_nas//disk.json"), EMPTY_JSON);
+    EXPECT_EQ(read_file(DISK_NUM_FILE), "old");
+    EXPECT_EQ(manager->state, 1);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
+    EXPECT_TRUE(contains(log, "scan path = /sys/block\n"));
+    EXPECT_TRUE(contains(log, "d_name = loop0\n"));
+    EXPECT_TRUE(contains(log, "have disk = 0\n"));
+}
+
+TEST_F(Manager, after_a_start_without_disks_no_rescan_runs_until_an_add_event)
+{
+    expect_in_child([&] {
+        manager_scan(manager, 0);
+        plug_with_part("sda", 400000);
+        for (int i = 0; i < 5; ++i) {
+            the_clock.now += 100;
+            EXPECT_EQ(manager_idle(manager), 0);
+        }
+        EXPECT_TRUE(stubs.calls().empty());
+        EXPECT_EQ(read_file(DISK_JSON_FILE), EMPTY_JSON);
+
+        dispatch(EVENT_DISK_ADD, "sda");
+        EXPECT_EQ(manager->state, 3);
+        manager_idle(manager);
+        EXPECT_TRUE(contains(read_file(DISK_JSON_FILE), "disk1_part1"));
+    });
+}
+
+TEST_F(Manager, a_start_with_disks_mounts_and_publishes_them)
+{
+    plug_with_part("sda", 400000);
+    plug_with_part("sdb", 800000);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(manager_scan(manager, 0), 0); });
+    EXPECT_EQ(manager->state, 3);
+    EXPECT_EQ(actions(), (std::vector<std::string>{
+                             "mount -t ext4 -o rw,defaults /dev/sdb1 /tmp/mountd/disk1_part1",
+                             "mount -t ext4 -o rw,defaults /dev/sda1 /tmp/mountd/disk2_part1"}))
+        << "disk 1 is the largest";
+    EXPECT_EQ(read_file(DISK_NUM_FILE), "2");
+    EXPECT_TRUE(contains(log, "have disk = 1\n"));
+    EXPECT_FALSE(contains(log, "check disk is alread mountd"));
+}
+
+TEST_F(Manager, the_scan_of_block_input_mode_takes_over_what_is_mounted)
+{
+    plug_with_part("sda", 400000);
+    add_mount("/dev/sda1", "/tmp/mountd/disk3_part3");
+    manager_scan(manager, 1);
+    const part_info* part = disk_sets_find_part(&manager->disks, "sda1");
+    ASSERT_NE(part, nullptr);
+    EXPECT_EQ(part->mount_status, 1);
+    EXPECT_STREQ(part->mount_path, "/tmp/mountd/disk3_part3");
+    EXPECT_TRUE(actions().empty());
+}
+
+TEST_F(Manager, a_scan_that_cannot_read_the_kernels_list_answers_1)
+{
+    const std::string log = expect_in_child([&] {
+        support_disk::allow_no_open_files();
+        EXPECT_EQ(manager_scan(manager, 0), 1);
+        EXPECT_EQ(manager->state, 1);
+    });
+    EXPECT_TRUE(contains(log, "]open dir err, dir = /sys/block\n"));
+}
+
+TEST_F(Manager, an_add_event_activates_adds_and_makes_the_mount_pass_due)
+{
+    plug_with_part("sda", 400000);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(dispatch(EVENT_DISK_ADD, "sda1"), 0); });
+    EXPECT_EQ(manager->state, 3);
+    EXPECT_EQ(manager->changed, 1);
+    EXPECT_EQ(manager->update_due, 1);
+    EXPECT_EQ(manager->t_refresh, NOW);
+    EXPECT_EQ(manager->t_update, NOW);
+    EXPECT_NE(disk_sets_find_part(&manager->disks, "sda1"), nullptr);
+    EXPECT_TRUE(contains(log, "===> get event = EVENT_DISK_ADD\n"));
+    EXPECT_TRUE(actions().empty()) << "no service is stopped, nothing is mounted yet";
+}
+
+TEST_F(Manager, a_name_of_32_characters_is_never_read_beyond_its_field)
+{
+    const std::string name = "sd0123456789012345678901234567AB";
+    ASSERT_EQ(name.size(), 32U);
+    memset(&manager->disks.sorted_once, 0, sizeof(manager->disks.sorted_once));
+    // The inventory stands right behind the event; its first bytes would be read as part of it.
+    text_copy(manager->disks.entries[0].disk.root.uid, "BEHIND");
+    for (const int32_t type : {EVENT_DISK_ADD, EVENT_DISK_REMOVE_DEV, EVENT_DISK_REMOVE_DISK}) {
+        manager->pipes.event.type = type;
+        memcpy(manager->pipes.event.dev_name, name.data(), EVENT_NAME_SIZE);
+        const std::string log = capture_stdout([&] { manager_dispatch(manager); });
+        EXPECT_TRUE(contains(log, "name = " + name + "\n")) << log;
+        EXPECT_FALSE(contains(log, "BEHIND")) << log;
+    }
+    EXPECT_EQ(times_called("blkid /dev/" + name), 1);
+}
+
+TEST_F(Manager, a_removal_event_stops_and_starts_the_four_services_even_for_an_unknown_device)
+{
+    for (const int32_t type : {EVENT_DISK_REMOVE_DEV, EVENT_DISK_REMOVE_DISK}) {
+        stubs.forget_calls();
+        manager->changed = 0;
+        EXPECT_EQ(dispatch(type, "sdq1"), 0);
+        EXPECT_EQ(stubs.calls(), joined({STOP_CALLS, START_CALLS})) << type;
+        EXPECT_EQ(manager->changed, 1);
+    }
+}
+
+TEST_F(Manager, remove_dev_unmounts_between_stopping_and_starting_the_services)
+{
+    plug_with_part("sda", 400000);
+    manager_scan(manager, 0);
+    stubs.forget_calls();
+    dispatch(EVENT_DISK_REMOVE_DEV, "sda1");
+    EXPECT_EQ(
+        actions(),
+        joined({STOP_CALLS, {"umount /dev/sda1", "umount /tmp/mountd/disk1_part1"}, START_CALLS}));
+    EXPECT_EQ(disk_sets_find_part(&manager->disks, "sda1"), nullptr);
+}
+
+TEST_F(Manager, remove_disk_takes_a_directory_name)
+{
+    plug_with_part("sda", 400000);
+    manager_scan(manager, 0);
+    stubs.forget_calls();
+    dispatch(EVENT_DISK_REMOVE_DISK, "disk1_part1");
+    EXPECT_EQ(
+        actions(),
+        joined({STOP_CALLS, {"umount /dev/sda1", "umount /tmp/mountd/disk1_part1"}, START_CALLS}));
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
+}
+
+TEST_F(Manager, a_safe_removal_unmounts_all_publishes_and_parks_until_the_next_add)
+{
+    expect_in_child([&] {
+        plug_with_part("sda", 400000);
+        manager_scan(manager, 0);
+        stubs.forget_calls();
+        const std::string log =
+            capture_stdout([&] { EXPECT_EQ(dispatch(EVENT_DISK_SAFE_REMOVE, ""), 0); });
+        EXPECT_TRUE(contains(log, "===> safe remove disk\n"));
+        EXPECT_EQ(actions(),
+                  joined({STOP_CALLS,
+                          {"umount /dev/sda1", "umount /tmp/mountd/disk1_part1", "umount /dev/sda"},
+                          START_CALLS}));
+        EXPECT_EQ(manager->state, 4);
+        EXPECT_EQ(read_file(DISK_NUM_FILE), "0");
+
+        stubs.forget_calls();
+        the_clock.slept = 0;
+        the_clock.now += 1000;
+        const std::string parked = capture_stdout([&] { EXPECT_EQ(manager_idle(manager), 0); });
+        EXPECT_TRUE(contains(parked, "]disk safe remove ...\n"));
+        EXPECT_EQ(the_clock.slept, 1);
+        EXPECT_TRUE(stubs.calls().empty());
+
+        dispatch(EVENT_DISK_ADD, "sda");
+        EXPECT_EQ(manager->state, 3);
+        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
+    });
+}
+
+TEST_F(Manager, heart_beats_do_nothing_and_unknown_types_answer_1)
+{
+    EXPECT_EQ(dispatch(EVENT_DISK_HEART_BEAT, ""), 0);
+    EXPECT_EQ(manager->state, 1);
+    EXPECT_EQ(manager->changed, 0);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(dispatch(9, ""), 1); });
+    EXPECT_TRUE(contains(log, "===> get event = err event\n"));
+    EXPECT_TRUE(contains(log, "]err event type = 9\n"));
+}
+
+TEST_F(Manager, the_first_idle_cycle_refreshes_updates_publishes_and_rescans_at_once)
+{
+    expect_in_child([&] {
+        plug_with_part("sda", 400000);
+        manager->state = MANAGER_ACTIVE;
+        const std::string log = capture_stdout([&] { manager_idle(manager); });
+        EXPECT_TRUE(contains(log, "=== === ===> update = 1\n")) << "disk.json is missing";
+        EXPECT_EQ(manager->t_refresh, NOW);
+        EXPECT_EQ(manager->t_update, NOW);
+        EXPECT_EQ(manager->t_publish, NOW);
+        EXPECT_EQ(manager->t_rescan, NOW);
+        EXPECT_EQ(manager->changed, 1) << "the rescan found a disk after the publication";
+        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
+    });
+}
+
+TEST_F(Manager, a_calm_cycle_does_nothing)
+{
+    make_calm();
+    const std::string log = capture_stdout([&] { manager_idle(manager); });
+    EXPECT_TRUE(contains(log, "=== === ===> update = 0\n"));
+    EXPECT_TRUE(stubs.calls().empty());
+    EXPECT_EQ(read_file(DISK_JSON_FILE), "old");
+}
+
+TEST_F(Manager, sizes_are_refreshed_after_more_than_4_seconds)
+{
+    make_calm();
+    support_disk::put_root(&manager->disks.entries[0], "sda", 0);
+    plug_disk("sda", "", 5000);
+    manager->t_update = NOW + 10;
+    manager->t_rescan = NOW + 10;
+    manager->t_refresh = NOW - 4;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_refresh, NOW - 4);
+    EXPECT_EQ(manager->disks.entries[0].disk.root.total_len, 0U);
+    manager->t_refresh = NOW - 5;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_refresh, NOW);
+    EXPECT_EQ(manager->disks.entries[0].disk.root.total_len, 5000U);
+}
+
+TEST_F(Manager, the_mount_pass_runs_every_3_seconds_or_when_it_is_due)
+{
+    make_calm();
+    manager->t_update = NOW - 2;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_update, NOW - 2);
+    EXPECT_EQ(manager->disks.sorted_once, 0);
+    manager->t_update = NOW - 3;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_update, NOW);
+    EXPECT_EQ(manager->disks.sorted_once, 1);
+
+    manager->disks.sorted_once = 0;
+    manager->update_due = 1;
+    manager_idle(manager);
+    EXPECT_EQ(manager->disks.sorted_once, 1);
+    EXPECT_EQ(manager->update_due, 0);
+}
+
+TEST_F(Manager, a_change_is_published_once_and_a_missing_document_counts_as_one)
+{
+    make_calm();
+    manager->t_publish = NOW - 20;
+    manager->changed = 1;
+    manager_idle(manager);
+    EXPECT_EQ(manager->changed, 0);
+    EXPECT_EQ(manager->t_publish, NOW);
+    EXPECT_NE(read_file(DISK_JSON_FILE), "old");
+
+    write_file(DISK_JSON_FILE, "old");
+    manager_idle(manager);
+    EXPECT_EQ(read_file(DISK_JSON_FILE), "old");
+
+    support::remove_all(DISK_JSON_FILE);
+    manager->t_publish = NOW - 20;
+    manager_idle(manager);
+    EXPECT_TRUE(std::filesystem::exists(DISK_JSON_FILE));
+    EXPECT_EQ(manager->t_publish, NOW);
+}
+
+TEST_F(Manager, thirty_seconds_after_the_last_change_every_idle_cycle_publishes)
+{
+    make_calm();
+    manager->t_publish = NOW - 29;
+    manager_idle(manager);
+    EXPECT_EQ(read_file(DISK_JSON_FILE), "old");
+    manager->t_publish = NOW - 30;
+    for (int i = 0; i < 3; ++i) {
+        write_file(DISK_JSON_FILE, "old");
+        manager_idle(manager);
+        EXPECT_NE(read_file(DISK_JSON_FILE), "old") << i;
+        EXPECT_EQ(manager->t_publish, NOW - 30) << i;
+    }
+}
+
+TEST_F(Manager, the_rescan_and_the_consistency_check_run_every_8_seconds)
+{
+    expect_in_child([&] {
+        make_calm();
+        plug_with_part("sda", 400000);
+        manager->t_rescan = NOW - 7;
+        manager_idle(manager);
+        EXPECT_EQ(manager->t_rescan, NOW - 7);
+        EXPECT_TRUE(stubs.calls().empty());
+        manager->t_rescan = NOW - 8;
+        manager_idle(manager);
+        EXPECT_EQ(manager->t_rescan, NOW);
+        EXPECT_EQ(manager->changed, 1);
+        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
+        EXPECT_EQ(times_called("mount"), 2) << "one look for each of the two checks";
+        EXPECT_EQ(running, 1);
+        EXPECT_EQ(restart_requested, 0);
+    });
+}
+
+TEST_F(Manager, a_mounted_device_that_vanished_deletes_the_database_and_asks_for_a_restart)
+{
+    expect_in_child([&] {
+        make_calm();
+        write_file(DISK_DB_FILE, "database");
+        add_mount("/dev/sdq1", "/tmp/mountd/disk1_part1");
+        manager->t_rescan = NOW - 8;
+        manager_idle(manager);
+        EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
+        EXPECT_EQ(running, 0);
+        EXPECT_EQ(restart_requested, 1);
+    });
+}
+
+TEST_F(Manager, two_devices_on_one_path_delete_the_database_and_ask_for_a_restart)
+{
+    expect_in_child([&] {
+        make_calm();
+        write_file(DISK_DB_FILE, "database");
+        for (const char* name : {"sda", "sdb"}) {
+            plug_disk(name, "", 5000);
+            add_mount(std::string("/dev/") + name, "/tmp/mountd/disk1_part1");
+        }
+        manager->t_rescan = NOW - 8;
+        manager_idle(manager);
+        EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
+        EXPECT_EQ(running, 0);
+        EXPECT_EQ(restart_requested, 1);
+        EXPECT_EQ(times_called("mount"), 2) << "both checks run, whatever the first one found";
+    });
+}
+
+TEST_F(Manager, 61_seconds_of_silence_with_the_companion_running_warn_and_go_on)
+{
+    const std::string log = expect_in_child([&] {
+        write_file(support_disk::PIDS_FILE, "321 322\n");
+        the_clock.step = 61;
+        the_clock.on_look = [&](int look) {
+            if (look == 2) {
+                send("#heart_beat\n");
+            } else if (look == 3) {
+                support::remove_all(support_disk::PIDS_FILE);
+            }
+        };
+        EXPECT_EQ(manager_event_loop(manager), 0);
+        EXPECT_EQ(running, 0);
+        EXPECT_EQ(times_called("pidof tarn_nas_sys"), 2);
+        EXPECT_EQ(restart_requested, 0);
+    });
+    EXPECT_EQ(support::count_of(log, "]sys timeout, 61 > 60\n"), 2) << log;
+    EXPECT_TRUE(contains(log, "get app = tarn_nas_sys, pid = 321 322\n"));
+    EXPECT_TRUE(contains(log, "EVENT_DISK_HEART_BEAT"));
+    EXPECT_TRUE(contains(log, "]===> proc not exist, name = tarn_nas_sys\n"));
+}
+
+TEST_F(Manager, 60_seconds_of_silence_are_none_and_every_valid_event_resets_them)
+{
+    expect_in_child([&] {
+        the_clock.step = 60;
+        the_clock.on_look = [&](int look) {
+            send("#heart_beat\n");
+            running = look < 6 ? 1 : 0;
+        };
+        EXPECT_EQ(manager_event_loop(manager), 0);
+        EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
+    });
+}
+
+TEST_F(Manager, a_cycle_without_an_event_does_not_reset_the_silence)
+{
+    const std::string log = expect_in_child([&] {
+        the_clock.step = 40;
+        the_clock.on_look = [&](int look) {
+            if (look == 2) {
+                send("no event\n");
+            }
+        };
+        EXPECT_EQ(manager_event_loop(manager), 0);
+        EXPECT_EQ(the_clock.looks, 3);
+        EXPECT_EQ(running, 0);
+    });
+    EXPECT_TRUE(contains(log, "]no event ...\n"));
+    EXPECT_TRUE(contains(log, "]sys timeout, 80 > 60\n"));
+}
+
+TEST_F(Manager, two_safe_removals_raise_the_silence_limit_to_1500_seconds)
+{
+    const std::string log = expect_in_child([&] {
+        dispatch(EVENT_DISK_SAFE_REMOVE, "");
+        dispatch(EVENT_DISK_SAFE_REMOVE, "");
+        the_clock.looks = 0;
+        the_clock.step = 1500;
+        the_clock.on_look = [&](int look) {
+            if (look == 2) {
+                send("#heart_beat\n");
+            } else if (look == 3) {
+                the_clock.now += 1;
+            }
+        };
+        EXPECT_EQ(manager_event_loop(manager), 0);
+        EXPECT_EQ(the_clock.looks, 3);
+    });
+    EXPECT_EQ(support::count_of(log, "]sys timeout, "), 1);
+    EXPECT_TRUE(contains(log, "]sys timeout, 1501 > 1500\n"));
+}
+
+TEST_F(Manager, many_safe_removals_do_not_overflow_the_silence_limit)
+{
+    expect_in_child([&] {
+        for (int i = 0; i < 20; ++i) {
+            dispatch(EVENT_DISK_SAFE_REMOVE, "");
+        }
+        the_clock.step = 100000;
+        the_clock.on_look = [&](int look) {
+            send("#heart_beat\n");
+            running = look < 4 ? 1 : 0;
+        };
+        manager_event_loop(manager);
+        EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
+    });
+}
+
+TEST_F(Manager, a_stopped_loop_ends_at_the_top_of_its_cycle)
+{
+    expect_in_child([&] {
+        running = 0;
+        send("#add:sda\n");
+        EXPECT_EQ(manager_event_loop(manager), 0);
+        EXPECT_TRUE(stubs.calls().empty());
+    });
+}
+
+TEST_F(Manager, a_run_scans_once_loops_and_rebuilds_the_manager_once_at_its_end)
+{
+    const std::string log = expect_in_child([&] {
+        send("#heart_beat\n");
+        the_clock.on_look = [](int look) { running = look < 2 ? 1 : 0; };
+        EXPECT_EQ(manager_run(manager), 0);
+        EXPECT_EQ(manager->state, 1);
+        EXPECT_GT(manager->pipes.fd_add_remove, 0);
+    });
+    EXPECT_EQ(support::count_of(log, "manager work again!\n"), 1);
+    EXPECT_EQ(support::count_of(log, "scan path = /sys/block\n"), 1);
+    EXPECT_EQ(support::count_of(log, "EVENT_DISK_HEART_BEAT"), 1);
+    EXPECT_EQ(read_file(DISK_JSON_FILE), EMPTY_JSON) << "the status file stays";
+}
