@@ -1,0 +1,148 @@
+#include "main/environment.h"
+
+#include <unistd.h>
+
+#include <chrono>
+#include <string>
+
+#include "log/log.h"
+#include "main/block_input.h"
+#include "manager/manager.h"
+#include "support_disk/disk_world.h"
+
+using support::contains;
+using support::read_file;
+using support::write_file;
+using support_disk::expect_in_child;
+
+namespace {
+
+class Environment : public support_disk::disk_world {
+protected:
+    // A running restart leaves this file, with what it saw of the pid file.
+    void add_restart_script()
+    {
+        support::remove_all("/run/restarted");
+        stubs.add_at("/etc/init.d/tarn_nas_diskmanager",
+                     "if [ -e /tmp/tarn_nas/disk_manager_pid ]; then seen=there; else seen=gone; "
+                     "fi\necho $seen >/run/restarted.new && mv /run/restarted.new /run/restarted");
+    }
+
+    static std::string wait_for_restart()
+    {
+        for (int i = 0; i < 500 && !std::filesystem::exists("/run/restarted"); ++i) {
+            usleep(10000);
+        }
+        return read_file("/run/restarted");
+    }
+
+    static int log_file_count()
+    {
+        int count = 0;
+        if (std::filesystem::exists("/tmp/log")) {
+            for (const auto& entry : std::filesystem::directory_iterator("/tmp/log")) {
+                count += contains(entry.path(), "/tmp/log/disk_log-") ? 1 : 0;
+            }
+        }
+        return count;
+    }
+};
+
+}  // namespace
+
+TEST_F(Environment, the_preparation_makes_pid_file_and_directories_and_takes_the_hook_away)
+{
+    write_file("/etc/hotplug.d/block/10-mount", "hook");
+    write_file("/etc/hotplug.d/block/20-other", "hook");
+    support::remove_all("/tmp/tarn_nas");
+    support::make_dir("/tmp/log");
+    expect_in_child([] {
+        EXPECT_EQ(init_environment(), 0);
+        EXPECT_EQ(read_file("/tmp/tarn_nas//disk_manager_pid"), std::to_string(getpid()));
+        log_file_close();
+    });
+    EXPECT_TRUE(std::filesystem::is_directory("/tmp/mountd"));
+    EXPECT_TRUE(std::filesystem::is_directory("/etc/config/tarn_nas"));
+    EXPECT_FALSE(std::filesystem::exists("/etc/hotplug.d/block/10-mount"));
+    EXPECT_TRUE(std::filesystem::exists("/etc/hotplug.d/block/20-other"));
+    EXPECT_EQ(log_file_count(), 1);
+}
+
+TEST_F(Environment, what_an_earlier_run_left_mounted_is_unmounted_by_force)
+{
+    add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
+    add_mount("/dev/sdb1", "/mnt");
+    expect_in_child([] {
+        init_environment();
+        log_file_close();
+    });
+    EXPECT_EQ(actions(), (std::vector<std::string>{"umount -f /dev/sda1",
+                                                   "umount -f /tmp/mountd/disk1_part1"}));
+}
+
+TEST_F(Environment, the_preparation_of_block_input_mode_does_no_more_than_its_own_part)
+{
+    write_file("/etc/hotplug.d/block/10-mount", "hook");
+    add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
+    expect_in_child([] {
+        init_block_input_environment();
+        EXPECT_EQ(read_file(PID_FILE), std::to_string(getpid()));
+    });
+    EXPECT_TRUE(std::filesystem::is_directory("/tmp/mountd"));
+    EXPECT_FALSE(std::filesystem::exists("/etc/config/tarn_nas"));
+    EXPECT_TRUE(std::filesystem::exists("/etc/hotplug.d/block/10-mount"));
+    EXPECT_EQ(log_file_count(), 0);
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
+TEST_F(Environment, a_restart_runs_the_init_script_and_does_not_wait_for_it)
+{
+    stubs.add_at("/etc/init.d/tarn_nas_diskmanager", "sleep 2; echo done >/run/restarted");
+    support::remove_all("/run/restarted");
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_EQ(restart_self(), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2));
+    EXPECT_EQ(wait_for_restart(), "done\n");
+    EXPECT_EQ(stubs.calls(), std::vector<std::string>{"/etc/init.d/tarn_nas_diskmanager restart"});
+}
+
+TEST_F(Environment, block_input_mode_takes_over_what_is_mounted_and_leaves_no_pid_file)
+{
+    plug_disk("sda", R"(PTTYPE="dos")", 9000);
+    plug_part("sda", "sda1", R"(UUID="U-1" TYPE="ext4")", 8000);
+    add_mount("/dev/sda1", "/tmp/mountd/disk4_part2");
+    stubs.add("pgrep");
+    add_restart_script();
+    const std::string log = expect_in_child([] {
+        running = 0;
+        EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
+    });
+    EXPECT_TRUE(contains(log, "disk manage run block input\n"));
+    EXPECT_TRUE(contains(log, "===> is already mountd\n"));
+    EXPECT_TRUE(actions().empty()) << "nothing is mounted again or unmounted";
+    EXPECT_TRUE(contains(read_file("/tmp/tarn_nas/disk.json"), "disk4_part2"));
+    EXPECT_FALSE(std::filesystem::exists(PID_FILE));
+    EXPECT_FALSE(contains(log, "manager work again!"));
+    EXPECT_FALSE(std::filesystem::exists("/run/restarted"));
+}
+
+TEST_F(Environment, a_requested_restart_runs_after_the_pid_file_is_gone)
+{
+    add_restart_script();
+    expect_in_child([] {
+        running = 0;
+        restart_requested = 1;
+        EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
+    });
+    EXPECT_EQ(wait_for_restart(), "gone\n");
+}
+
+TEST_F(Environment, block_input_mode_ends_with_1_beside_another_instance)
+{
+    write_file(PID_FILE, "4123");
+    stubs.add("pgrep", "echo 4123");
+    expect_in_child([] { EXPECT_EQ(run_block_input_mode(0, nullptr), 1); });
+    EXPECT_EQ(read_file(PID_FILE), "4123");
+    EXPECT_FALSE(std::filesystem::exists(PIPE_ADD_REMOVE)) << "nothing was created";
+    EXPECT_FALSE(std::filesystem::exists("/tmp/mountd"));
+}
