@@ -1,5 +1,5 @@
 # How SQLite is built for a small device. Only options that change no file format and that its makers support when they
-# are given to the finished sqlite3.c are here: those that cut the grammar save 200 kB more, in combinations that
+# are given to the finished sqlite3.c are here: those that cut the grammar would save more, in combinations that
 # nobody tests.
 
 set(sqlite_options
