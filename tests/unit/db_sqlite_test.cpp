@@ -354,7 +354,9 @@ TEST_F(Database, AStepThatFailsIsLoggedAndFinalizes)
     ASSERT_EQ(db_exec(&handle, "insert into disk values (1, 'a')"), 0);
     ASSERT_EQ(db_prepare(&handle, "insert into disk values (1, 'b')"), 0);
     std::string log = log_of([&] { EXPECT_EQ(db_step_done(&handle), 1); });
-    EXPECT_TRUE(contains(log, ERR + "err code = ")) << log;
+    EXPECT_EQ(log, ERR + "err str = UNIQUE constraint failed: disk.id\n" + INFO +
+                       "sqlite err code = 19\n" + INFO +
+                       "sqlite err = UNIQUE constraint failed: disk.id\n");
     EXPECT_EQ(handle.stmt, nullptr);
 
     ASSERT_EQ(db_prepare(&handle, "insert into disk values (1, 'b')"), 0);

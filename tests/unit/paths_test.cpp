@@ -172,3 +172,22 @@ TEST(DevNameIsShellSafe, RefusesWhatTheShellWouldRead)
         EXPECT_FALSE(dev_name_is_shell_safe(name)) << name;
     }
 }
+
+TEST(MountPathIsUsable, TakesNamesDirectlyBelowTheMountBase)
+{
+    for (const char* path : {"/tmp/mountd/disk1_part1", "/tmp/mountd/disk16_part8", "/tmp/mountd/a",
+                             "/tmp/mountd/a.b"}) {
+        EXPECT_TRUE(mount_path_is_usable(path)) << path;
+    }
+}
+
+TEST(MountPathIsUsable, RefusesEveryOtherPath)
+{
+    for (const char* path :
+         {"", "/", "/tmp", "/tmp/mount", "/tmp/mountd", "/tmp/mountd/", "/tmp/mountdx/disk1_part1",
+          "/tmp/mountd/.", "/tmp/mountd/..", "/tmp/mountd/../x", "/tmp/mountd/.hidden",
+          "/tmp/mountd/a/b", "/tmp/mountd//a", "/tmp/mountd/a b", "/tmp/mountd/a;reboot",
+          "/tmp/mountd/$(reboot)", "tmp/mountd/a", "/mnt/mountd/a", "/tmp/mountd/a\n"}) {
+        EXPECT_FALSE(mount_path_is_usable(path)) << path;
+    }
+}

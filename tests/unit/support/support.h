@@ -24,6 +24,10 @@
 
 namespace support {
 
+// Standard output is line-buffered, as the daemon's is: its lines and those of its commands stand
+// in their order also in a file.
+inline const bool line_buffered = setvbuf(stdout, nullptr, _IOLBF, 0) == 0;
+
 // The file's content; empty when there is none.
 inline std::string read_file(const std::string& path)
 {
