@@ -200,8 +200,9 @@ def test_a_partition_without_filesystem_goes_by_its_partition_uuid_and_is_not_mo
     assert not world.exists("/tmp/mountd/disk1_part1")
 
 
+@pytest.mark.needs_fs("ext4")
 def test_an_mmc_device_is_the_sd_card_whatever_its_path(world, start_daemon):
-    card = world.partitioned_disk(swap(1200))
+    card = world.partitioned_disk(Partition("ext4", 1200))
     stick = world.partitioned_disk(swap(1100))
     world.plug(card, "mmcblk0")
     world.plug(stick, "sda")
@@ -209,6 +210,7 @@ def test_an_mmc_device_is_the_sd_card_whatever_its_path(world, start_daemon):
     wait_directories(world, {"mmcblk0p1": "disk1_part1", "sda1": "disk2_part1"})
     assert {name: part.sd_card for name, part in world.parts().items()} == {
         "mmcblk0p1": 1, "sda1": 0}
+    assert world.mounted() == {"/dev/mmcblk0p1": "/tmp/mountd/disk1_part1"}
 
 
 def test_the_platform_text_in_the_device_path_makes_a_disk_the_sd_card(world, start_daemon):
@@ -267,7 +269,6 @@ def test_30_s_after_the_last_change_the_files_are_rewritten_in_every_idle_cycle(
     assert directories(world) == {"sda1": "disk1_part1"}
 
 
-@pytest.mark.needs_fs("ext4")
 def test_disk_count_follows_arrivals_and_departures(world, daemon):
     first, second = (world.partitioned_disk(swap(1200)) for _ in range(2))
     world.hotplug(first, "sda")
