@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <ctime>
 #include <string>
 
@@ -41,7 +42,8 @@ extern "C" time_t time(time_t* out) noexcept
 extern "C" int nanosleep(const timespec* duration, timespec* rest)
 {
     if (!the_clock.skip_sleeps) {
-        return clock_nanosleep(CLOCK_MONOTONIC, 0, duration, rest) == 0 ? 0 : -1;
+        errno = clock_nanosleep(CLOCK_MONOTONIC, 0, duration, rest);
+        return errno == 0 ? 0 : -1;
     }
     the_clock.slept += duration->tv_sec;
     if (the_clock.on_sleep) {
