@@ -70,6 +70,15 @@ TEST_F(Discovery, a_blank_disk_is_never_added)
     EXPECT_TRUE(is_all_zero(sets));
 }
 
+TEST_F(Discovery, loop0_mtdblock3_sr0_and_others_are_never_added_although_blkid_knows_them)
+{
+    for (const char* name : {"loop0", "mtdblock3", "sr0", "ram0", "ubi0_0", "nvme0n1", "sd"}) {
+        plug_disk(name, ext4_details("U-1"), 9000);
+        EXPECT_EQ(disk_sets_add_dev(&sets, name), 0);
+        EXPECT_TRUE(is_all_zero(sets)) << name;
+    }
+}
+
 TEST_F(Discovery, a_name_with_shell_characters_runs_no_command_and_is_answered_with_dev_err)
 {
     for (const char* name : {"sda;touch /run/harm", "sda$(touch /run/harm)", "sda`touch /run/harm`",

@@ -2,10 +2,12 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
+#include <csignal>
 #include <cstring>
 #include <string>
 
@@ -251,6 +253,26 @@ TEST_F(EventPipes, an_over_long_add_line_is_rejected_and_nothing_of_it_becomes_a
     }
     send(PIPE_ADD_REMOVE, "#heart_beat\n");
     EXPECT_EQ(event_receive(&pipes), 1);
+}
+
+TEST_F(EventPipes, a_writer_that_never_ends_its_line_does_not_hold_the_reader)
+{
+    const pid_t writer = fork();
+    if (writer == 0) {
+        const int fd = open(PIPE_ADD_REMOVE, O_WRONLY | O_CLOEXEC);
+        const std::string text(4096, 'x');
+        // Killed below; ends by itself if the test does not live to do so.
+        alarm(30);
+        while (write(fd, text.data(), text.size()) > 0) {
+        }
+        _exit(0);
+    }
+    ASSERT_GT(writer, 0);
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_EQ(event_receive(&pipes), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(10));
+    kill(writer, SIGKILL);
+    EXPECT_EQ(waitpid(writer, nullptr, 0), writer);
 }
 
 TEST_F(EventPipes, binary_bytes_are_dropped_or_kept_as_a_name_but_never_lose_the_next_message)

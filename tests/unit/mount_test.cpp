@@ -247,6 +247,27 @@ TEST_F(Mount, an_occupied_remembered_directory_is_replaced_by_the_new_one_in_the
     EXPECT_TRUE(contains(log, "=== ===> update uid = U-1, mount = /tmp/mountd/disk1_part1\n"));
 }
 
+TEST_F(Mount, a_remembered_path_that_is_not_ours_is_overwritten_and_reaches_no_command)
+{
+    for (const char* path : {"/etc", "/tmp/mountd", "/tmp/mountd/../etc", "/tmp/mountdisk/x",
+                             "/tmp/mountd/x;touch /run/harm", "/tmp/mountd/a/b", ""}) {
+        support::remove_all(DISK_DB_FILE);
+        support::remove_all(support_disk::MOUNTS_FILE);
+        remember("U-1", "sda1", "disk4_part2");
+        sqlite3* db = nullptr;
+        ASSERT_EQ(sqlite3_open(DISK_DB_FILE, &db), SQLITE_OK);
+        const std::string sql = std::string("update disk set mount_path='") + path + "'";
+        EXPECT_EQ(sqlite3_exec(db, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK);
+        sqlite3_close(db);
+
+        part_info* part = put_ready_part(0, 1, "U-1");
+        mount_part(part);
+        EXPECT_STREQ(part->mount_path, "/tmp/mountd/disk1_part1") << path;
+        EXPECT_EQ(remembered("U-1"), "sda1 disk1_part1 /tmp/mountd/disk1_part1 yes") << path;
+    }
+    EXPECT_FALSE(std::filesystem::exists("/run/harm"));
+}
+
 TEST_F(Mount, a_damaged_database_does_not_keep_a_partition_from_its_mount)
 {
     support::write_file(DISK_DB_FILE, std::string(8192, 'x'));
