@@ -1,4 +1,4 @@
-"""Messages in the three pipes: what is understood, what is dropped, and that nothing is ever run."""
+"""Messages in the three pipes: what is understood, what is dropped, that nothing is ever run."""
 
 import os
 import signal
@@ -199,9 +199,9 @@ def test_a_burst_of_40_lines_in_one_write_is_taken_in_full_and_in_order(world, d
 UNSAFE_NAMES = [
     "sda$(touch /tmp/owned)", "sda`touch /tmp/owned`", "sda|touch /tmp/owned",
     "sda||touch /tmp/owned", "sda&touch /tmp/owned", "sda&&touch /tmp/owned", "sda>/tmp/owned",
-    "sda >/tmp/owned", "$(touch${IFS}/tmp/owned)", "sda 1", "sda\t1", "sda'", 'sda"', "sda\\", "sd*",
-    "sd?", "sd[a]", "sd{a,b}", "~", "sda#", "sda(", "/../tmp", "/../../tmp", "../etc/passwd", "sda/1",
-    "sda=1", "sda,1", "sda%1", "sda@1", "sda+1", "sda:1", "sda^1",
+    "sda >/tmp/owned", "$(touch${IFS}/tmp/owned)", "sda 1", "sda\t1", "sda'", 'sda"', "sda\\",
+    "sd*", "sd?", "sd[a]", "sd{a,b}", "~", "sda#", "sda(", "/../tmp", "/../../tmp", "../etc/passwd",
+    "sda/1", "sda=1", "sda,1", "sda%1", "sda@1", "sda+1", "sda:1", "sda^1",
 ]
 
 

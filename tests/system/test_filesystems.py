@@ -30,7 +30,8 @@ def fs_types(world):
 @pytest.mark.needs_fs("ext2", "ext4", "ntfs")
 def test_ext_and_ntfs_are_recognised_mounted_as_what_they_are_and_hold_files(world, start_daemon):
     disk = world.partitioned_disk(
-        Partition("ext4", 1500, "FOUR"), Partition("ntfs", 1400, "NT"), Partition("ext2", 1300, "TWO"),
+        Partition("ext4", 1500, "FOUR"), Partition("ntfs", 1400, "NT"),
+        Partition("ext2", 1300, "TWO"),
         Partition("ext3", 1200, "THREE"), Partition("ext4", 1100, options=("-O", "^has_journal")))
     world.plug(disk, "sda")
     # With the secondary type in front blkid's first "TYPE=" is ext2.
@@ -59,7 +60,7 @@ def test_ext_and_ntfs_are_recognised_mounted_as_what_they_are_and_hold_files(wor
                     "mount -t ext2 -o rw,defaults /dev/sda4 /tmp/mountd/disk1_part4",
                     "chmod a+wr /tmp/mountd/disk1_part1"):
         assert f"exec cmd = {command}\n" in ran
-    assert ran.index("mkdir -p '/tmp/mountd/disk1_part1'") < ran.index("chmod a+wr /tmp/mountd/disk1_")
+    assert ran.index("mkdir -p '/tmp/mountd/disk1_part1'") < ran.index("chmod a+wr /tmp/mountd/")
 
 
 @pytest.mark.needs_fs("ext4", "ntfs")
@@ -193,7 +194,8 @@ def test_a_fat_label_with_two_hyphens_is_kept(world, start_daemon):
 
 @pytest.mark.needs_fs("vfat", "exfat")
 def test_fat_and_exfat_partitions_are_mounted(world, start_daemon):
-    disk = world.partitioned_disk(Partition("vfat", 1200, "FATTY"), Partition("exfat", 1100, "EXTRA"))
+    disk = world.partitioned_disk(Partition("vfat", 1200, "FATTY"),
+                                  Partition("exfat", 1100, "EXTRA"))
     world.plug(disk, "sda")
     start_daemon()
     wait_mounted(world, {"sda1": "disk1_part1", "sda2": "disk1_part2"})

@@ -278,3 +278,17 @@ def test_disk_count_follows_arrivals_and_departures(world, daemon):
     world.wait(lambda: world.disk_num() == "1", 20, "1 in disk_num.txt")
     world.hotunplug(second)
     world.wait(lambda: no_disks(world), 20, "a status without disks")
+
+
+def test_of_nine_partitions_the_first_eight_met_are_kept(world, start_daemon):
+    disk = world.partitioned_disk(*(swap(1000 + number) for number in range(9)))
+    world.plug(disk, "sda")
+    listed = world.run("ls", "-U", "/sys/block/sda").stdout.split()
+    met = [name for name in listed if name.startswith("sda")]
+    daemon = start_daemon()
+    world.wait(lambda: len(world.parts()) == 8, 40, "8 partitions")
+
+    by_size = sorted(met[:8], key=lambda name: int(name.removeprefix("sda")), reverse=True)
+    assert directories(world) == {name: f"disk1_part{number}"
+                                  for number, name in enumerate(by_size, 1)}
+    assert f"sub part full, root dev name = sda, sub dev = {met[8]}\n" in daemon.log()

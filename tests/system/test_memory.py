@@ -43,8 +43,7 @@ def test_disks_come_back_to_their_directories_under_other_names_and_in_another_o
     wait_mounted(world, {"sda1": "disk1_part1", "sdb1": "disk2_part1"})
     uids = [uuid_of(world, name) for name in ("sda1", "sdb1")]
     wait_rows(world, row(world, "sda1", "disk1_part1"), row(world, "sdb1", "disk2_part1"))
-    world.sh("echo first > /tmp/mountd/disk1_part1/file; echo second > /tmp/mountd/disk2_part1/file;"
-             " sync")
+    world.sh("cd /tmp/mountd; echo first > disk1_part1/file; echo second > disk2_part1/file; sync")
 
     quiet_moment(world, daemon)
     world.hotunplug(first)

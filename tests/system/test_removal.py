@@ -39,7 +39,8 @@ def mountd_flags(world):
 
 def hold(world, path):
     """A process that keeps a mount busy; returns its Popen."""
-    process = world.popen("/bin/sh", "-c", f"echo $$ > /run/server.pid; cd {path} && exec sleep 600")
+    process = world.popen("/bin/sh", "-c",
+                          f"echo $$ > /run/server.pid; cd {path} && exec sleep 600")
     world.wait(lambda: world.run("pgrep", "-x", "sleep", check=False).stdout, 10, "the sleeper")
     return process
 
@@ -60,7 +61,8 @@ def test_a_mounted_partition_is_removed_while_the_services_that_use_it_are_stopp
     server.wait(10)
     assert world.mounted() == {}
     assert calls(world) == STOPPED + STARTED
-    ran = [command for command in commands(daemon.log_since(mark)) if not command.startswith("mount")]
+    ran = [command for command in commands(daemon.log_since(mark))
+           if not command.startswith("mount")]
     assert ran[:10] == [f"/etc/init.d/{name} stop" for name in SERVICES] + [
         "umount /dev/sda1", "umount /tmp/mountd/disk1_part1"] + [
         f"/etc/init.d/{name} start" for name in SERVICES]
@@ -92,7 +94,8 @@ def test_a_whole_disk_is_removed_by_its_name_with_all_its_partitions(world, star
 
     log = daemon.log()
     order = ["remove root dev = sda\n", "remove disk, root dev = sda\n", "==> umount dev = sda1\n",
-             "==> umount dev = sda2\n", "=== === ===> remove root path:\n", "==> umount dev = sda\n"]
+             "==> umount dev = sda2\n", "=== === ===> remove root path:\n",
+             "==> umount dev = sda\n"]
     places = [log.index(text) for text in order]
     assert places == sorted(places)
     assert world.mounted() == {}
@@ -151,7 +154,8 @@ def test_after_a_safe_removal_the_daemon_rests_and_only_announced_disks_return(
     first_rescan_over(world, daemon)
 
     world.safe_remove()
-    world.wait(lambda: world.parts() == {} and world.disk_num() == "0", 20, "a status without disks")
+    world.wait(lambda: world.parts() == {} and world.disk_num() == "0", 20,
+               "a status without disks")
     assert world.mounted() == {}
     assert calls(world) == STOPPED + STARTED
     assert set(mountd_flags(world).values()) == {"no"}
