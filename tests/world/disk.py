@@ -4,6 +4,7 @@ An image is a memfd: it has no path, costs only the blocks that were written, an
 is gone when the last loop device and descriptor on it are.
 """
 
+import itertools
 import json
 import os
 import re
@@ -17,6 +18,8 @@ SECTOR = 512
 TABLE_MIB = 2
 EXTENDED_TYPES = {"5", "f", "85"}
 TOOL_TIMEOUT = 120
+# Each image has a name of its own, by which its loop devices are known.
+_image_numbers = itertools.count()
 
 # Few inodes and a lazy journal keep a fresh filesystem to some hundred kilobytes
 # of memory; many worlds run side by side.
@@ -119,7 +122,7 @@ class Disk:
 
 def blank_disk(size_mib, sector_size=SECTOR):
     """A disk of zeros: no table, no filesystem."""
-    image = os.memfd_create("disk")
+    image = os.memfd_create(f"disk-{os.getpid()}-{next(_image_numbers)}")
     os.ftruncate(image, size_mib * MIB)
     return Disk(image, size_mib, sector_size=sector_size)
 

@@ -46,6 +46,7 @@ class LoopDevice:
         self._offset = offset
         self.path = f"/dev/loop{self.number}"
         self.devno = os.makedev(LOOP_MAJOR, self.number)
+        self._backing = self._backing_file()
 
     def cut_off(self):
         """Make all further input and output fail, as on a device pulled out.
@@ -62,8 +63,18 @@ class LoopDevice:
             self._fd = -1
 
     def is_attached(self):
-        """True while the kernel still holds the image under this number."""
-        return os.path.exists(f"/sys/block/loop{self.number}/loop/backing_file")
+        """True while the kernel still holds this image under this number.
+
+        Another world may have been given the number meanwhile.
+        """
+        return bool(self._backing) and self._backing_file() == self._backing
+
+    def _backing_file(self):
+        try:
+            with open(f"/sys/block/loop{self.number}/loop/backing_file") as stream:
+                return stream.read()
+        except OSError:
+            return ""
 
 
 def _attach(image_fd, offset, size):
