@@ -93,9 +93,14 @@ class Daemon:
 
         A rescan that finds nothing new prints nothing, but the consistency check
         that follows it prints this line twice.  Of three such lines the last one
-        belongs to a rescan begun after the mark, wherever the mark fell.
+        belongs to a rescan begun after the mark, wherever the mark fell.  The check
+        of the devices behind it prints a line for each mount.
         """
-        return self._count("mount dev num = ", mark) >= 3
+        pieces = self.log_since(mark).split("mount dev num = ", 3)
+        if len(pieces) < 4 or "\n" not in pieces[3]:
+            return False
+        mounts = int(pieces[3].split("\n", 1)[0])
+        return pieces[3].count("check mount dev err, dev[") >= mounts
 
     def wait_exit(self, timeout=30):
         """Wait until it has ended; returns the exit status."""
