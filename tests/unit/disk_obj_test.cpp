@@ -102,7 +102,7 @@ TEST_F(DiskObj, a_ninth_partition_is_refused_and_changes_nothing)
         capture_stdout([&] { EXPECT_EQ(disk_obj_add_sub_part(disk, "sda9"), 1); });
     EXPECT_TRUE(contains(log, "sub part full, root dev name = sda, sub dev = sda9\n"));
     EXPECT_TRUE(contains(log, "Warning["));
-    EXPECT_EQ(memcmp(&before, disk, sizeof(before)), 0);
+    EXPECT_TRUE(support_disk::same_bytes(before, *disk));
     EXPECT_EQ(slots(), "sda1 sda2 sda3 sda4 sda5 sda6 sda7 sda8");
 }
 

@@ -20,7 +20,7 @@ using support_disk::fake_clock;
 using support_disk::the_clock;
 
 // In front of the C library's, for every test of this program.
-extern "C" time_t time(time_t* out) noexcept
+extern "C" time_t time(time_t* timer) noexcept
 {
     timespec now{};
     clock_gettime(CLOCK_REALTIME, &now);
@@ -33,19 +33,19 @@ extern "C" time_t time(time_t* out) noexcept
         result = the_clock.now;
         the_clock.now += the_clock.step;
     }
-    if (out != nullptr) {
-        *out = result;
+    if (timer != nullptr) {
+        *timer = result;
     }
     return result;
 }
 
-extern "C" int nanosleep(const timespec* duration, timespec* rest)
+extern "C" int nanosleep(const timespec* requested_time, timespec* remaining)
 {
     if (!the_clock.skip_sleeps) {
-        errno = clock_nanosleep(CLOCK_MONOTONIC, 0, duration, rest);
+        errno = clock_nanosleep(CLOCK_MONOTONIC, 0, requested_time, remaining);
         return errno == 0 ? 0 : -1;
     }
-    the_clock.slept += duration->tv_sec;
+    the_clock.slept += requested_time->tv_sec;
     if (the_clock.on_sleep) {
         the_clock.on_sleep();
     }

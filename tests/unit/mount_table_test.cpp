@@ -117,10 +117,9 @@ TEST_F(MountTable, each_number_may_be_left_out)
 TEST_F(MountTable, a_17th_line_is_left_out_and_the_16_before_stay)
 {
     for (int i = 1; i <= 18; ++i) {
-        const std::string number = std::to_string(i);
-        const std::string line =
-            "/dev/sda" + number + " on /tmp/mountd/disk" + number + "_part1 type ext4 (rw)";
-        EXPECT_EQ(parse_mount_line(&table, line.c_str()), i <= MOUNT_TABLE_SIZE ? 0 : 1) << i;
+        char line[80];
+        snprintf(line, sizeof(line), "/dev/sda%d on /tmp/mountd/disk%d_part1 type ext4 (rw)", i, i);
+        EXPECT_EQ(parse_mount_line(&table, line), i <= MOUNT_TABLE_SIZE ? 0 : 1) << i;
     }
     EXPECT_EQ(table.num, 16);
     EXPECT_STREQ(table.entries[0].dev, "/dev/sda1");

@@ -17,6 +17,7 @@ support_disk::child_result parse(std::vector<std::string> arguments)
 {
     return support_disk::run_in_child([&] {
         std::vector<char*> argv;
+        argv.reserve(arguments.size() + 1);
         for (std::string& argument : arguments) {
             argv.push_back(argument.data());
         }

@@ -5,6 +5,7 @@
 #include <linux/magic.h>
 #include <sys/vfs.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -190,6 +191,13 @@ inline part_info* put_part(disk_obj* disk, int slot, const char* dev_name, uint6
     disk->parts[slot].part = make_part(dev_name, mib);
     disk->parts[slot].part.ref_root = &disk->root;
     return &disk->parts[slot].part;
+}
+
+template <typename T>
+bool same_bytes(const T& a, const T& b)
+{
+    const auto* bytes = reinterpret_cast<const unsigned char*>(&a);
+    return std::equal(bytes, bytes + sizeof(a), reinterpret_cast<const unsigned char*>(&b));
 }
 
 template <typename T>
