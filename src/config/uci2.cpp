@@ -26,11 +26,7 @@ struct path_copy {
         if (path == nullptr || value == nullptr) {
             return;
         }
-        const size_t size = strlen(path) + strlen(value) + 2;
-        text = static_cast<char*>(malloc(size));
-        if (text != nullptr) {
-            text_format(text, size, "%s=%s", path, value);
-        }
+        text = text_join(path, "=", value);
     }
     ~path_copy() { free(text); }
     path_copy(const path_copy&) = delete;

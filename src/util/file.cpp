@@ -13,8 +13,6 @@
 
 namespace {
 
-constexpr int REMOVE_TRIES = 3;
-constexpr size_t SHELL_WORDS_SIZE = 32;  // room for the command's own words around a path
 constexpr mode_t PRIVATE_MODE = 0600;
 
 // A descriptor that closes itself.
@@ -40,52 +38,6 @@ int write_and_close(FILE* stream, const void* bytes, int32_t length)
     }
     fclose(stream);
     return ret == 0 ? 0 : 1;
-}
-
-bool removed_in_tries(const char* path, int (*remove_call)(const char*))
-{
-    for (int i = 0; i < REMOVE_TRIES; ++i) {
-        if (remove_call(path) == 0) {
-            return true;
-        }
-    }
-    return false;
-}
-
-// Runs "<words around the path>" for a path of any length; no_memory tells a failed allocation.
-int exec_with_path(const char* before, const char* path, const char* after, bool* no_memory)
-{
-    const size_t size = strlen(path) + SHELL_WORDS_SIZE;
-    auto* command = static_cast<char*>(malloc(size));
-    *no_memory = command == nullptr;
-    if (command == nullptr) {
-        return 1;
-    }
-    text_format(command, size, "%s%s%s", before, path, after);
-    const int ret = exec_cmd(command, 1);
-    free(command);
-    return ret;
-}
-
-int remove_directory(const char* path)
-{
-    dir_stream dir(path);
-    if (dir.stream == nullptr || chdir(path) != 0) {
-        log_errno("ope dir err, path = %s\n", path);
-        return 1;
-    }
-    while (const char* name = dir.next_name()) {
-        // Hidden entries stay as well as "." and "..": what a user hid is not ours to delete.
-        if (name[0] != '.') {
-            path_remove_tree(name);
-        }
-    }
-    if (chdir("../") != 0) {
-        log_errno("ope dir err, path = %s\n", path);
-        return 1;
-    }
-    dir_remove_retry(path);
-    return 0;
 }
 
 }  // namespace
@@ -298,62 +250,6 @@ int file_delete(const char* path)
     return 0;
 }
 
-int path_rm_rf(const char* path)
-{
-    if (path == nullptr) {
-        return 1;
-    }
-    bool no_memory = false;
-    if (exec_with_path("rm -rf \"", path, "\"", &no_memory) != 0) {
-        log_errno("rm err, fn = %s\n", path);
-        return 1;
-    }
-    return 0;
-}
-
-int file_remove_retry(const char* path)
-{
-    return removed_in_tries(path, remove) ? 0 : path_rm_rf(path);
-}
-
-int dir_remove_retry(const char* path)
-{
-    if (removed_in_tries(path, rmdir)) {
-        return 0;
-    }
-    log_errno("rm err, fn = %s\n", path);
-    return 1;
-}
-
-int link_remove_retry(const char* path)
-{
-    if (removed_in_tries(path, unlink)) {
-        return 0;
-    }
-    log_errno("rm err, fn = %s\n", path);
-    return 1;
-}
-
-int path_get_type(const char* path)
-{
-    if (path == nullptr) {
-        log_err("err!\n");
-        return -1;
-    }
-    struct stat info {};
-    if (lstat(path, &info) != 0) {
-        log_errno("file not exist, file = %s\n", path);
-        return -1;
-    }
-    if (S_ISDIR(info.st_mode)) {
-        return 1;
-    }
-    if (S_ISREG(info.st_mode)) {
-        return 2;
-    }
-    return S_ISLNK(info.st_mode) ? 3 : 0;
-}
-
 int dir_make(const char* path)
 {
     if (path == nullptr) {
@@ -362,28 +258,14 @@ int dir_make(const char* path)
     if (path_exists(path)) {
         return 0;
     }
-    bool no_memory = false;
-    const int ret = exec_with_path("mkdir -p '", path, "'", &no_memory);
-    if (no_memory) {
+    char* command = text_join("mkdir -p '", path, "'");
+    if (command == nullptr) {
         log_err("err!\n");
+        return 1;
     }
+    const int ret = exec_cmd(command, 1);
+    free(command);
     return ret;
-}
-
-int path_remove_tree(const char* path)
-{
-    switch (path_get_type(path)) {
-        case 1:
-            return remove_directory(path);
-        case 2:
-            file_remove_retry(path);
-            return 0;
-        case 3:
-            link_remove_retry(path);
-            return 0;
-        default:
-            return 1;
-    }
 }
 
 int fifo_create_open(const char* path)

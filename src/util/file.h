@@ -1,4 +1,4 @@
-// Small files, directories and pipes: whole-file readers and writers, removal, creation.
+// Small files, directories and pipes: whole-file readers and writers, deletion, creation.
 // Results are 0 for success and 1 for failure unless a line says otherwise; every failure is
 // logged where it happens.
 #pragma once
@@ -57,23 +57,8 @@ int file_read_buf(const char* path, void* buffer, int32_t size);
 
 int file_delete(const char* path);
 
-// rm -rf of a path.
-int path_rm_rf(const char* path);
-
-// Up to 3 tries each without a pause; the first falls back to path_rm_rf.
-int file_remove_retry(const char* path);
-int dir_remove_retry(const char* path);
-int link_remove_retry(const char* path);
-
-// What lies at a path, links not followed: -1 error, 0 other, 1 directory, 2 file, 3 link.
-int path_get_type(const char* path);
-
 // mkdir -p; anything that exists at path counts as success. No single quote may stand in path.
 int dir_make(const char* path);
-
-// Removes a file, link or directory tree. Entries that begin with a dot are left alone, and so is
-// the directory that holds one. Leaves the working directory in the parent of path.
-int path_remove_tree(const char* path);
 
 // Makes the FIFO (mode 0600) when path is missing and opens it for reading and writing without
 // blocking, so that it never reports end-of-file. The caller owns the descriptor; -1 on failure.

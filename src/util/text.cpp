@@ -2,6 +2,7 @@
 
 #include <cstdarg>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 
 void text_copy(char* out, size_t size, const char* text)
@@ -26,6 +27,16 @@ void text_format(char* out, size_t size, const char* fmt, ...)
     va_start(args, fmt);
     vsnprintf(out, size, fmt, args);
     va_end(args);
+}
+
+char* text_join(const char* a, const char* b, const char* c)
+{
+    const size_t size = strlen(a) + strlen(b) + strlen(c) + 1;
+    auto* joined = static_cast<char*>(malloc(size));
+    if (joined != nullptr) {
+        text_format(joined, size, "%s%s%s", a, b, c);
+    }
+    return joined;
 }
 
 bool text_has_prefix(const char* text, const char* prefix)

@@ -13,6 +13,9 @@ void text_copy_n(char* out, size_t size, const char* text, size_t count);
 void text_format(char* out, size_t size, const char* fmt, ...)
     __attribute__((format(printf, 3, 4)));
 
+// The three texts in one, to be released with free(); null when there is no memory.
+char* text_join(const char* a, const char* b, const char* c);
+
 bool text_has_prefix(const char* text, const char* prefix);
 
 // The value behind the first occurrence of key and the quote that follows it; empty when the text

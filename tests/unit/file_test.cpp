@@ -1,44 +1,24 @@
 #include "util/file.h"
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
 
 #include <cerrno>
 #include <cstring>
 
+#include "support/files.h"
 #include "support/support.h"
 
+using support::exists;
 using support::log_of;
 using support::make_dir;
+using support::make_link;
+using support::make_socket;
 using support::read_file;
 using support::write_file;
 
 namespace {
 
 const std::string ROOT = "/run/files";
-
-bool exists(const std::string& path)
-{
-    return std::filesystem::exists(std::filesystem::symlink_status(path));
-}
-
-void make_link(const std::string& target, const std::string& path)
-{
-    ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
-}
-
-// Something that exists and that open refuses, also to root.
-void make_socket(const std::string& path)
-{
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    ASSERT_LT(path.size(), sizeof(address.sun_path));
-    memcpy(address.sun_path, path.c_str(), path.size() + 1);
-    ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-    close(fd);
-}
 
 mode_t mode_of(const std::string& path)
 {
@@ -83,10 +63,7 @@ using FileReadAt = Files;
 using FileReadAll = Files;
 using FileReadBuf = Files;
 using FileDelete = Files;
-using Remove = Files;
-using PathGetType = Files;
 using DirMake = Files;
-using PathRemoveTree = Files;
 using FifoCreateOpen = Files;
 
 }  // namespace
@@ -456,125 +433,6 @@ TEST_F(FileDelete, ANullPathGivesOneSilently)
     EXPECT_EQ(log, "");
 }
 
-TEST_F(Remove, RmRfTakesAWholeTreeInDoubleQuotes)
-{
-    std::string path = ROOT + "/with space";
-    write_file(path + "/deep/file", "x");
-    write_file(path + "/.hidden", "x");
-    write_file(ROOT + "/with", "stays");
-    std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 0); });
-    EXPECT_EQ(support::count_of(log, "exec cmd = rm -rf \"/run/files/with space\"\n"), 1) << log;
-    EXPECT_FALSE(exists(path));
-    EXPECT_TRUE(exists(ROOT + "/with"));
-}
-
-TEST_F(Remove, RmRfTakesAPathOfAnyLength)
-{
-    std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
-    make_dir(path);
-    log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 0); });
-    EXPECT_FALSE(exists(path));
-}
-
-TEST_F(Remove, RmRfWhoseCommandIsKilledGivesOne)
-{
-    // The shell itself is killed: the path ends the quotes.
-    std::string path = ROOT + "/x\"; kill -KILL $$; \"";
-    support::capture_stderr([&] {
-        std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 1); });
-        std::string last = support::lines_of(log).back();
-        EXPECT_EQ(last.substr(0, 17), "ERROR[file.cpp:N]") << log;
-        EXPECT_TRUE(support::contains(last, ")rm err, fn = " + path)) << log;
-    });
-}
-
-TEST_F(Remove, AFileGoesWithoutACommand)
-{
-    write_file(file, "x");
-    std::string log = log_of([&] { EXPECT_EQ(file_remove_retry(file.c_str()), 0); });
-    EXPECT_EQ(log, "");
-    EXPECT_FALSE(exists(file));
-}
-
-TEST_F(Remove, AFileThatStaysIsRemovedByRmRf)
-{
-    write_file(ROOT + "/dir/entry", "");
-    std::string path = ROOT + "/dir";
-    std::string log = log_of([&] { EXPECT_EQ(file_remove_retry(path.c_str()), 0); });
-    EXPECT_EQ(support::count_of(log, "exec cmd = rm -rf \"/run/files/dir\"\n"), 1) << log;
-    EXPECT_FALSE(exists(path));
-}
-
-TEST_F(Remove, AnEmptyDirectoryGoes)
-{
-    std::string path = ROOT + "/dir";
-    make_dir(path);
-    EXPECT_EQ(dir_remove_retry(path.c_str()), 0);
-    EXPECT_FALSE(exists(path));
-}
-
-TEST_F(Remove, ADirectoryThatIsNotEmptyStays)
-{
-    write_file(ROOT + "/dir/entry", "");
-    std::string path = ROOT + "/dir";
-    std::string log = log_of([&] { EXPECT_EQ(dir_remove_retry(path.c_str()), 1); });
-    EXPECT_EQ(log, "ERROR[file.cpp:N](Directory not empty)rm err, fn = /run/files/dir\n");
-    EXPECT_TRUE(exists(ROOT + "/dir/entry"));
-}
-
-TEST_F(Remove, ALinkGoesAndItsTargetStays)
-{
-    write_file(file, "x");
-    std::string link = ROOT + "/link";
-    make_link(file, link);
-    EXPECT_EQ(link_remove_retry(link.c_str()), 0);
-    EXPECT_FALSE(exists(link));
-    EXPECT_TRUE(exists(file));
-}
-
-TEST_F(Remove, AMissingLinkGivesTheSystemsError)
-{
-    std::string log = log_of([&] { EXPECT_EQ(link_remove_retry(missing.c_str()), 1); });
-    EXPECT_EQ(log, "ERROR[file.cpp:N](No such file or directory)rm err, fn = /run/files/missing\n");
-}
-
-TEST_F(PathGetType, TellsDirectoriesFilesLinksAndTheRest)
-{
-    write_file(file, "");
-    ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
-    make_socket(ROOT + "/socket");
-    make_link(ROOT, ROOT + "/dir_link");
-    make_link(missing, ROOT + "/dead_link");
-    struct {
-        std::string path;
-        int expected;
-    } cases[] = {
-        {ROOT, 1},
-        {file, 2},
-        {ROOT + "/dir_link", 3},
-        {ROOT + "/dead_link", 3},
-        {ROOT + "/fifo", 0},
-        {ROOT + "/socket", 0},
-        {"/dev/null", 0},
-    };
-    for (const auto& c : cases) {
-        EXPECT_EQ(path_get_type(c.path.c_str()), c.expected) << c.path;
-    }
-}
-
-TEST_F(PathGetType, AMissingPathIsAnErrorWithTheSystemsText)
-{
-    std::string log = log_of([&] { EXPECT_EQ(path_get_type(missing.c_str()), -1); });
-    EXPECT_EQ(log, "ERROR[file.cpp:N](No such file or directory)file not exist, file = "
-                   "/run/files/missing\n");
-}
-
-TEST_F(PathGetType, ANullPathIsAnError)
-{
-    std::string log = log_of([] { EXPECT_EQ(path_get_type(nullptr), -1); });
-    EXPECT_EQ(log, "ERROR[file.cpp:N]err!\n");
-}
-
 TEST_F(DirMake, MakesTheDirectoriesAbove)
 {
     std::string path = ROOT + "/a b/c";
@@ -609,84 +467,6 @@ TEST_F(DirMake, FailsWhenItsCommandCannotRunToItsEnd)
     // The shell itself is killed: the path ends the quotes.
     std::string path = ROOT + "/x' ; kill -KILL $$ ; '";
     support::capture_stderr([&] { log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 1); }); });
-}
-
-TEST_F(PathRemoveTree, TakesAFileALinkAndATree)
-{
-    write_file(ROOT + "/tree/file", "x");
-    write_file(ROOT + "/tree/deep/deeper/file", "x");
-    make_link(missing, ROOT + "/tree/dead_link");
-    write_file(file, "x");
-    make_link(file, ROOT + "/link");
-    EXPECT_EQ(path_remove_tree((ROOT + "/link").c_str()), 0);
-    EXPECT_EQ(path_remove_tree(file.c_str()), 0);
-    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
-    EXPECT_TRUE(std::filesystem::is_empty(ROOT));
-}
-
-TEST_F(PathRemoveTree, LeavesHiddenFilesAndTheirDirectoryAndStillGivesZero)
-{
-    write_file(ROOT + "/tree/.hidden", "x");
-    write_file(ROOT + "/tree/seen", "x");
-    std::string log = log_of([] { EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0); });
-    EXPECT_EQ(log, "ERROR[file.cpp:N](Directory not empty)rm err, fn = /run/files/tree\n");
-    EXPECT_TRUE(exists(ROOT + "/tree/.hidden"));
-    EXPECT_FALSE(exists(ROOT + "/tree/seen"));
-}
-
-TEST_F(PathRemoveTree, LeavesAHiddenDirectory)
-{
-    write_file(ROOT + "/tree/..dir/file", "x");
-    log_of([] { EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0); });
-    EXPECT_TRUE(exists(ROOT + "/tree/..dir/file"));
-}
-
-TEST_F(PathRemoveTree, ALinkToADirectoryIsUnlinkedAndItsTargetStays)
-{
-    write_file(ROOT + "/target/file", "x");
-    std::string link = ROOT + "/link";
-    make_link(ROOT + "/target", link);
-    EXPECT_EQ(path_remove_tree(link.c_str()), 0);
-    EXPECT_FALSE(exists(link));
-    EXPECT_TRUE(exists(ROOT + "/target/file"));
-}
-
-TEST_F(PathRemoveTree, ALinkInsideATreeIsNotFollowed)
-{
-    write_file(ROOT + "/target/file", "x");
-    make_dir(ROOT + "/tree");
-    make_link(ROOT + "/target", ROOT + "/tree/link");
-    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
-    EXPECT_FALSE(exists(ROOT + "/tree"));
-    EXPECT_TRUE(exists(ROOT + "/target/file"));
-}
-
-TEST_F(PathRemoveTree, LeavesTheWorkingDirectoryInTheParent)
-{
-    write_file(ROOT + "/tree/deep/file", "x");
-    EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
-    EXPECT_EQ(std::filesystem::current_path(), ROOT);
-}
-
-TEST_F(PathRemoveTree, ARelativePathOfTwoNamesLeavesItsEmptyDirectory)
-{
-    // The directory is removed by the path as it was given, from inside its parent.
-    write_file(ROOT + "/tree/deep/file", "x");
-    ASSERT_EQ(chdir(ROOT.c_str()), 0);
-    log_of([] { EXPECT_EQ(path_remove_tree("tree/deep"), 0); });
-    EXPECT_EQ(std::filesystem::current_path(), ROOT + "/tree");
-    EXPECT_TRUE(std::filesystem::is_empty(ROOT + "/tree/deep"));
-}
-
-TEST_F(PathRemoveTree, WhatIsNeitherFileLinkNorDirectoryIsRefused)
-{
-    ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
-    EXPECT_EQ(path_remove_tree((ROOT + "/fifo").c_str()), 1);
-    EXPECT_TRUE(exists(ROOT + "/fifo"));
-    log_of([&] {
-        EXPECT_EQ(path_remove_tree(missing.c_str()), 1);
-        EXPECT_EQ(path_remove_tree(nullptr), 1);
-    });
 }
 
 TEST_F(FifoCreateOpen, MakesThePipeForItsOwnerAlone)

@@ -1,0 +1,122 @@
+#include "util/remove_tree.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstdlib>
+
+#include "log/log.h"
+#include "util/exec.h"
+#include "util/file.h"
+#include "util/text.h"
+
+namespace {
+
+constexpr int REMOVE_TRIES = 3;
+
+bool removed_in_tries(const char* path, int (*remove_call)(const char*))
+{
+    for (int i = 0; i < REMOVE_TRIES; ++i) {
+        if (remove_call(path) == 0) {
+            return true;
+        }
+    }
+    return false;
+}
+
+int remove_directory(const char* path)
+{
+    dir_stream dir(path);
+    if (dir.stream == nullptr || chdir(path) != 0) {
+        log_errno("ope dir err, path = %s\n", path);
+        return 1;
+    }
+    while (const char* name = dir.next_name()) {
+        // Hidden entries stay as well as "." and "..": what a user hid is not ours to delete.
+        if (name[0] != '.') {
+            path_remove_tree(name);
+        }
+    }
+    if (chdir("../") != 0) {
+        log_errno("ope dir err, path = %s\n", path);
+        return 1;
+    }
+    dir_remove_retry(path);
+    return 0;
+}
+
+}  // namespace
+
+int path_rm_rf(const char* path)
+{
+    if (path == nullptr) {
+        return 1;
+    }
+    char* command = text_join("rm -rf \"", path, "\"");
+    const bool done = command != nullptr && exec_cmd(command, 1) == 0;
+    free(command);
+    if (!done) {
+        log_errno("rm err, fn = %s\n", path);
+    }
+    return done ? 0 : 1;
+}
+
+int file_remove_retry(const char* path)
+{
+    return removed_in_tries(path, remove) ? 0 : path_rm_rf(path);
+}
+
+int dir_remove_retry(const char* path)
+{
+    if (removed_in_tries(path, rmdir)) {
+        return 0;
+    }
+    log_errno("rm err, fn = %s\n", path);
+    return 1;
+}
+
+int link_remove_retry(const char* path)
+{
+    if (removed_in_tries(path, unlink)) {
+        return 0;
+    }
+    log_errno("rm err, fn = %s\n", path);
+    return 1;
+}
+
+int path_get_type(const char* path)
+{
+    if (path == nullptr) {
+        log_err("err!\n");
+        return -1;
+    }
+    struct stat info {};
+    if (lstat(path, &info) != 0) {
+        log_errno("file not exist, file = %s\n", path);
+        return -1;
+    }
+    if (S_ISDIR(info.st_mode)) {
+        return 1;
+    }
+    if (S_ISREG(info.st_mode)) {
+        return 2;
+    }
+    return S_ISLNK(info.st_mode) ? 3 : 0;
+}
+
+int path_remove_tree(const char* path)
+{
+    switch (path_get_type(path)) {
+        case 1:
+            return remove_directory(path);
+        case 2:
+            file_remove_retry(path);
+            return 0;
+        case 3:
+            link_remove_retry(path);
+            return 0;
+        default:
+            return 1;
+    }
+}
