@@ -4,7 +4,6 @@
 
 #include "support_disk/disk_world.h"
 
-using support::capture_stdout;
 using support::contains;
 using support_disk::expect_in_child;
 
