@@ -128,7 +128,9 @@ bool statfs_fails = false;
 
 }  // namespace
 
-// Stands in front of the C library's, for filesystems that a test cannot have.
+// Stands in front of the C library's, whose parameters have reserved names, for filesystems that a
+// test cannot have.
+// NOLINTNEXTLINE(readability-inconsistent-declaration-parameter-name)
 int statfs(const char* path, struct statfs* info) noexcept
 {
     if (statfs_fails) {

@@ -12,7 +12,7 @@ using support::log_of;
 
 namespace {
 
-constexpr off_t DEVICE_SIZE = 64 * 1024;
+constexpr off_t DEVICE_SIZE = 0x10000;
 
 // An open device for one probe.
 class device_fd {

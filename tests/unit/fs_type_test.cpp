@@ -14,7 +14,7 @@ namespace {
 
 using lines = std::vector<std::string>;
 
-constexpr off_t DEVICE_SIZE = 64 * 1024;
+constexpr off_t DEVICE_SIZE = 0x10000;
 constexpr const char* SCRATCH = "/tmp/out.txt";
 const std::string RULE = "fs_type.cpp(N)==========================\n";
 

@@ -14,7 +14,6 @@ using support::log_of;
 using support::make_dir;
 using support::make_link;
 using support::make_socket;
-using support::read_file;
 using support::write_file;
 
 namespace {
