@@ -131,7 +131,7 @@ bool statfs_fails = false;
 // Stands in front of the C library's, whose parameters have reserved names, for filesystems that a
 // test cannot have.
 // NOLINTNEXTLINE(readability-inconsistent-declaration-parameter-name)
-int statfs(const char* path, struct statfs* info) noexcept
+int statfs(const char* path, struct statfs* info)
 {
     if (statfs_fails) {
         errno = EIO;
