@@ -114,18 +114,24 @@ TEST(ExecCmd, StopsAtTheFirstSuccess)
 
 TEST(ExecCmd, ACommandThatCannotBeStartedFails)
 {
-    std::string text = capture_stdout([] {
-        capture_stderr([] {
-            EXPECT_EQ(in_child([] {
-                          // The limit does not hold for root.
-                          const rlimit none{0, 0};
-                          const bool limited =
-                              setrlimit(RLIMIT_NPROC, &none) == 0 && setuid(NOBODY) == 0;
-                          return limited ? exec_cmd("true", 3, "c.cpp", 1) : 2;
-                      }),
-                      1);
+    constexpr int NOT_TOLD = 3;
+    int result = 0;
+    std::string text = capture_stdout([&] {
+        capture_stderr([&] {
+            result = in_child([] {
+                // The limit does not hold for root.
+                const rlimit none{0, 0};
+                if (setrlimit(RLIMIT_NPROC, &none) != 0 || setuid(NOBODY) != 0) {
+                    return 2;
+                }
+                return system("true") == -1 ? exec_cmd("true", 3, "c.cpp", 1) : NOT_TOLD;
+            });
         });
     });
+    if (result == NOT_TOLD) {
+        GTEST_SKIP() << "this C library reports a shell that cannot be started as an exit code";
+    }
+    EXPECT_EQ(result, 1);
     EXPECT_EQ(count_of(text, "c.cpp(1)exec cmd = true, ret = -1\n"), 3) << text;
 }
 
