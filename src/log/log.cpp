@@ -4,7 +4,6 @@
 #include <syslog.h>
 
 #include <cerrno>
-#include <csignal>
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
@@ -26,33 +25,6 @@ const char* base_name(const char* file)
 {
     const char* slash = strrchr(file, '/');
     return slash != nullptr ? slash + 1 : file;
-}
-
-// Signals stay blocked while a message goes out: the handler logs too, and neither stdio nor
-// syslog may be entered a second time from inside.
-struct signal_block {
-    sigset_t before;
-
-    signal_block()
-    {
-        sigset_t all;
-        sigfillset(&all);
-        sigprocmask(SIG_BLOCK, &all, &before);
-    }
-    ~signal_block() { sigprocmask(SIG_SETMASK, &before, nullptr); }
-    signal_block(const signal_block&) = delete;
-    signal_block& operator=(const signal_block&) = delete;
-};
-
-// A reader of our output that went away raises SIGPIPE on every line. Its handler would log, and
-// so raise the next one for ever; the signal that our own write caused is taken back instead.
-void discard_own_sigpipe()
-{
-    sigset_t pipe_only;
-    sigemptyset(&pipe_only);
-    sigaddset(&pipe_only, SIGPIPE);
-    const timespec no_wait{};
-    sigtimedwait(&pipe_only, nullptr, &no_wait);
 }
 
 void put_syslog(const char* text)
@@ -103,29 +75,20 @@ void log_printf(int32_t level, const char* file, int32_t line, const char* fmt, 
 #pragma GCC diagnostic pop
     va_end(args);
 
-    {
-        const signal_block quiet;
-        log_print_stdout("%s", message);
-        if (log_syslog != 0) {
-            put_syslog(message);
-        }
+    log_print_stdout("%s", message);
+    if (log_syslog != 0) {
+        put_syslog(message);
     }
     errno = saved_errno;
 }
 
 void log_print_stdout(const char* fmt, ...)
 {
-    const signal_block quiet;
     va_list args;
     va_start(args, fmt);
-    const bool failed = vprintf(fmt, args) < 0 || ferror(stdout) != 0;
+    vprintf(fmt, args);
     va_end(args);
-    if (!failed) {
-        return;
-    }
-    if (errno == EPIPE) {
-        discard_own_sigpipe();
-    }
+    // A reader may come back: one failed line must not silence the following ones.
     clearerr(stdout);
 }
 

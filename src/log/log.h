@@ -11,7 +11,7 @@ constexpr int32_t LOG_LVL_ERRNO = 4;  // an operation failed, with the system's 
 
 // Prints one message with the base name of file and the line in front. Callers end fmt with a
 // newline themselves. Header and format together are cut at 255 characters, the message at 511.
-// Keeps errno. The daemon's signal handler calls it too: signals wait while a message goes out.
+// Keeps errno. Not for signal handlers.
 void log_printf(int32_t level, const char* file, int32_t line, const char* fmt, ...)
     __attribute__((format(printf, 4, 5)));
 

@@ -1,3 +1,4 @@
+#include <csignal>
 #include <cstdio>
 
 #include "log/log.h"
@@ -36,6 +37,8 @@ int main(int argc, char* argv[])
 {
     // A supervisor that reads our output sees each line at once, in order with the commands'.
     setvbuf(stdout, nullptr, _IOLBF, 0);
+    // Nor does a reader that went away end us before the handlers are in place.
+    signal(SIGPIPE, SIG_IGN);
     log_set_debug();
     if (parse_options(argc, argv) != 0) {
         return 1;

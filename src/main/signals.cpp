@@ -1,45 +1,44 @@
 #include "main/signals.h"
 
-#include <cerrno>
+#include <unistd.h>
+
 #include <csignal>
 #include <initializer_list>
 
 #include "log/log.h"
 #include "manager/manager.h"
+#include "manager/signal_inbox.h"
 
 volatile int32_t sigint_count = 0;
 
 namespace {
 
-// The first SIGINT is only logged, so that a stray one does not take the disks away.
-void on_sigint()
+// A reader of our output that went away raises SIGPIPE at every line of ours. Telling of it would
+// raise the next one, for ever.
+bool is_of_our_own_writing(const siginfo_t* info)
 {
-    const int32_t count = sigint_count;
-    log_info("get sig = SIGINT, c = %d\n", count);
-    sigint_count = count + 1;
-    if (sigint_count > 1) {
-        loop_run_stop();
-    }
+    return info->si_signo == SIGPIPE && info->si_code == SI_USER && info->si_pid == getpid();
 }
 
-void on_signal(int sig)
+// May interrupt anything: counts and sets flags, nothing else.
+void on_signal(int sig, siginfo_t* info, void* context)
 {
-    const int saved_errno = errno;
-    switch (sig) {
-        case SIGUSR2:
-            log_enable_syslog();
-            break;
-        case SIGPIPE:
-            log_info("get sig = SIGPIPE\n");
-            break;
-        case SIGINT:
-            on_sigint();
-            break;
-        default:
-            log_warn("*** *** get sig = %d\n", sig);
-            break;
+    static_cast<void>(context);
+    if (sig == SIGUSR2) {
+        log_enable_syslog();
+        return;
     }
-    errno = saved_errno;
+    if (is_of_our_own_writing(info)) {
+        return;
+    }
+    signal_inbox_note(sig);
+    // The first SIGINT only shows in the log, so that a stray one does not take the disks away.
+    if (sig == SIGINT) {
+        sigint_count = sigint_count + 1;
+        if (sigint_count > 1) {
+            loop_run_stop();
+        }
+    }
 }
 
 }  // namespace
@@ -47,8 +46,11 @@ void on_signal(int sig)
 int setup_signals()
 {
     signal(SIGTERM, SIG_IGN);
+    struct sigaction action {};
+    action.sa_sigaction = on_signal;
+    action.sa_flags = SA_SIGINFO | SA_RESTART;
     for (const int sig : {SIGPIPE, SIGUSR1, SIGUSR2, SIGALRM, SIGHUP, SIGCHLD, SIGINT}) {
-        signal(sig, on_signal);
+        sigaction(sig, &action, nullptr);
     }
     return 0;
 }

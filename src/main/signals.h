@@ -4,7 +4,7 @@
 
 #include <cstdint>
 
-// Number of SIGINTs seen.
+// Number of SIGINTs seen. The handler counts and sets flags; messages come from the loop.
 extern volatile int32_t sigint_count;
 
 // Always 0.

@@ -10,6 +10,7 @@
 #include "log/log.h"
 #include "manager/rescan.h"
 #include "manager/services.h"
+#include "manager/signal_inbox.h"
 #include "util/block_dev.h"
 #include "util/file.h"
 #include "util/paths.h"
@@ -71,6 +72,15 @@ bool somebody_is_there(time_t* last, time_t now)
     }
     *last = now;
     return true;
+}
+
+// Tells of the signals that arrived during the last cycle's work, and of those that end the wait.
+bool receive_event(disk_manager* manager)
+{
+    signal_inbox_report();
+    const bool received = event_receive(&manager->pipes) == 1;
+    signal_inbox_report();
+    return received;
 }
 
 int on_add(disk_manager* manager, const char* dev_name)
@@ -240,9 +250,7 @@ int manager_event_loop(disk_manager* manager)
         const time_t now = time(nullptr);
         if (!somebody_is_there(&last, now)) {
             running = 0;
-            return 0;
-        }
-        if (event_receive(&manager->pipes) == 1) {
+        } else if (receive_event(manager)) {
             last = now;
             manager_dispatch(manager);
         } else {
@@ -250,6 +258,7 @@ int manager_event_loop(disk_manager* manager)
             manager_idle(manager);
         }
     }
+    signal_inbox_report();
     return 0;
 }
 

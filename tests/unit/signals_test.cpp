@@ -10,6 +10,7 @@
 
 #include "log/log.h"
 #include "manager/manager.h"
+#include "manager/signal_inbox.h"
 #include "support/support.h"
 #include "support_disk/child.h"
 
@@ -61,6 +62,7 @@ TEST(Signals, one_sigint_only_logs_and_the_second_stops_the_loop)
         EXPECT_EQ(running, 0);
         raise(SIGINT);
         EXPECT_EQ(sigint_count, 3);
+        signal_inbox_report();
     });
     for (const char* line :
          {"get sig = SIGINT, c = 0\n", "get sig = SIGINT, c = 1\n", "get sig = SIGINT, c = 2\n"}) {
@@ -75,6 +77,7 @@ TEST(Signals, sigpipe_is_logged_by_name_and_others_as_warnings_by_number)
         for (const int sig : {SIGPIPE, SIGUSR1, SIGALRM, SIGHUP, SIGCHLD}) {
             raise(sig);
         }
+        signal_inbox_report();
         EXPECT_EQ(running, 1);
     });
     EXPECT_TRUE(contains(log, "get sig = SIGPIPE\n"));
@@ -83,6 +86,84 @@ TEST(Signals, sigpipe_is_logged_by_name_and_others_as_warnings_by_number)
         EXPECT_TRUE(contains(log, line)) << log;
     }
     EXPECT_EQ(support::count_of(log, "Warning["), 4);
+}
+
+TEST(Signals, sigpipe_of_the_daemons_own_writing_is_not_told)
+{
+    const std::string log = expect_in_child([] {
+        setup_signals();
+        int nobody[2];
+        EXPECT_EQ(pipe(nobody), 0);
+        close(nobody[0]);
+        EXPECT_EQ(write(nobody[1], "x", 1), -1);
+        EXPECT_EQ(errno, EPIPE);
+        signal_inbox_report();
+    });
+    EXPECT_EQ(log, "");
+}
+
+TEST(Signals, nothing_is_printed_by_the_handler_itself)
+{
+    const std::string log = expect_in_child([] {
+        setup_signals();
+        for (const int sig : {SIGPIPE, SIGUSR1, SIGUSR2, SIGALRM, SIGHUP, SIGCHLD, SIGINT}) {
+            raise(sig);
+        }
+    });
+    EXPECT_EQ(log, "");
+}
+
+TEST(Signals, no_signal_is_blocked_afterwards)
+{
+    expect_in_child([] {
+        sigset_t before;
+        sigset_t after;
+        sigprocmask(SIG_SETMASK, nullptr, &before);
+        setup_signals();
+        raise(SIGHUP);
+        signal_inbox_report();
+        sigprocmask(SIG_SETMASK, nullptr, &after);
+        for (int sig = 1; sig < NSIG; ++sig) {
+            EXPECT_EQ(sigismember(&after, sig), sigismember(&before, sig)) << sig;
+        }
+    });
+}
+
+TEST(SignalInbox, tells_every_counted_signal_once)
+{
+    const std::string log = expect_in_child([] {
+        for (int i = 0; i < 3; ++i) {
+            signal_inbox_note(SIGHUP);
+        }
+        signal_inbox_note(SIGPIPE);
+        signal_inbox_report();
+        signal_inbox_report();
+    });
+    EXPECT_EQ(support::count_of(log, "*** *** get sig = 1\n"), 3);
+    EXPECT_EQ(support::count_of(log, "get sig = SIGPIPE\n"), 1);
+    EXPECT_EQ(support::lines_of(log).size(), 4U) << log;
+}
+
+TEST(SignalInbox, goes_on_counting_sigints_from_report_to_report)
+{
+    const std::string log = expect_in_child([] {
+        signal_inbox_note(SIGINT);
+        signal_inbox_report();
+        signal_inbox_note(SIGINT);
+        signal_inbox_report();
+    });
+    EXPECT_EQ(support::count_of(log, "get sig = SIGINT, c = 0\n"), 1);
+    EXPECT_EQ(support::count_of(log, "get sig = SIGINT, c = 1\n"), 1);
+}
+
+TEST(SignalInbox, keeps_nothing_of_a_signal_that_is_never_told)
+{
+    const std::string log = expect_in_child([] {
+        signal_inbox_note(SIGUSR2);
+        signal_inbox_note(SIGQUIT);
+        signal_inbox_report();
+    });
+    EXPECT_EQ(log, "");
 }
 
 TEST(Signals, sigusr2_says_nothing_and_switches_the_copy_to_syslog_on)
