@@ -25,12 +25,12 @@ constexpr int SDCARD_POINT_SIZE = 16;
 void read_blkid_line(const char* dev_name, const char* dev_path, char (&text)[BLKID_TEXT_SIZE + 1])
 {
     memset(text, 0, sizeof(text));
-    if (!dev_name_is_shell_safe(dev_name)) {
+    if (!name_is_shell_safe(dev_name)) {
         return;
     }
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_DEV_CHECK);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_DEV_CHECK);
     file_read_buf(SCRATCH_DEV_CHECK, text, BLKID_TEXT_SIZE);
     file_delete(SCRATCH_DEV_CHECK);
 }

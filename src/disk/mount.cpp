@@ -213,7 +213,12 @@ void sync_part_with_db(part_info* part)
         store_new_row(part);
         return;
     }
-    if (!mount_path_is_usable(record.mount_path) || is_path_mounted(record.mount_path) == 1) {
+    if (!mount_path_is_usable(record.mount_path)) {
+        log_warn("remembered path err, uid = %s, mount = %s\n", record.uid, record.mount_path);
+        overwrite_row(&record, part);
+        return;
+    }
+    if (is_path_mounted(record.mount_path) == 1) {
         overwrite_row(&record, part);
         return;
     }

@@ -80,8 +80,13 @@ void log_mount(const mount_entry* entry)
     log_info("%s ===> %s\n", entry->dev, entry->path);
 }
 
+// Anybody who may mount a userspace filesystem chooses names in the mount table.
 void umount_force(const char* target)
 {
+    if (!path_is_shell_safe(target)) {
+        log_warn("umount err, target = %s\n", target);
+        return;
+    }
     char command[FORCED_UMOUNT_SIZE];
     text_format(command, sizeof(command), "umount -f %s", target);
     exec_cmd(command, 1);

@@ -40,7 +40,7 @@ int read_mount_table(mount_table* table)
     memset(table, 0, sizeof(*table));
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "mount > %s", SCRATCH_MOUNT);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_MOUNT);
 
     FILE* listing = fopen(SCRATCH_MOUNT, "re");
     if (listing == nullptr) {

@@ -16,6 +16,10 @@ namespace {
 
 void run_umount(const char* target)
 {
+    if (!path_is_shell_safe(target)) {
+        log_warn("umount err, target = %s\n", target);
+        return;
+    }
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "umount %s", target);
     exec_cmd(command, 1);

@@ -108,7 +108,7 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
 {
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_BLKID_TYPE);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_BLKID_TYPE);
 
     char* text = file_read_all(SCRATCH_BLKID_TYPE);
     if (text == nullptr) {

@@ -1,7 +1,9 @@
 #include "log/log.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <syslog.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdarg>
@@ -15,6 +17,7 @@ constexpr size_t HEADER_SIZE = 256;
 constexpr size_t MESSAGE_SIZE = 512;
 constexpr size_t LOG_PATH_SIZE = 128;
 constexpr int32_t LOG_LINES_MAX = 1500;
+constexpr mode_t LOG_FILE_MODE = 0644;
 
 uint8_t log_debug = 1;
 volatile uint8_t log_syslog = 0;
@@ -52,6 +55,21 @@ void build_header(char (&header)[HEADER_SIZE], int32_t level, const char* module
             snprintf(header, HEADER_SIZE, "%s(%d)%s", module, line, fmt);
             return;
     }
+}
+
+// As fopen with "at+", but a link that somebody planted under the name, which the clock foretells,
+// is not followed, and the services that this daemon starts do not keep the file open.
+FILE* open_log(const char* path)
+{
+    const int fd = open(path, O_RDWR | O_CREAT | O_APPEND | O_NOFOLLOW | O_CLOEXEC, LOG_FILE_MODE);
+    if (fd < 0) {
+        return nullptr;
+    }
+    FILE* stream = fdopen(fd, "a+");
+    if (stream == nullptr) {
+        close(fd);
+    }
+    return stream;
 }
 
 }  // namespace
@@ -111,13 +129,11 @@ int log_file_open()
     char path[LOG_PATH_SIZE]{};
     snprintf(path, sizeof(path), "/tmp/log/disk_log-%d-%d-%d-%d-%d-%d.txt", date.tm_year + 1900,
              date.tm_mon + 1, date.tm_mday, date.tm_hour, date.tm_min, date.tm_sec);
-    log_fp = fopen(path, "at+");
+    log_fp = open_log(path);
     if (log_fp == nullptr) {
         log_print_stdout("err, file = %s\n", path);
         return 1;
     }
-    // The services that this daemon starts must not keep its log file open.
-    fcntl(fileno(log_fp), F_SETFD, FD_CLOEXEC);
     return 0;
 }
 

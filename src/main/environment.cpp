@@ -12,7 +12,7 @@ int init_environment()
 {
     log_file_open();
     write_pid_file();
-    dir_make(MOUNT_BASE);
+    dir_make_own(MOUNT_BASE);
     dir_make(CONFIG_DIR);
     umount_all_force();
     file_delete(HOTPLUG_MOUNT_HOOK);
@@ -23,7 +23,7 @@ int init_environment()
 void init_block_input_environment()
 {
     write_pid_file();
-    dir_make(MOUNT_BASE);
+    dir_make_own(MOUNT_BASE);
     init_hook();
 }
 

@@ -6,6 +6,7 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/claim.h"
 #include "util/exec.h"
 #include "util/file.h"
 #include "util/paths.h"
@@ -23,7 +24,7 @@ void list_daemon_pids(char (&list)[PID_LIST_SIZE + 1])
     file_delete(SCRATCH_PGREP);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "pgrep -f tarn_nas_diskmanager > %s", SCRATCH_PGREP);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_PGREP);
     file_read_buf(SCRATCH_PGREP, list, PID_LIST_SIZE);
     file_delete(SCRATCH_PGREP);
 }
@@ -38,6 +39,8 @@ bool is_listed(const char* pid_text, const char* list)
 
 int check_single_instance()
 {
+    // A pid file in somebody else's directory says nothing of ours.
+    claim_path(RUNTIME_DIR);
     if (!path_exists(PID_FILE)) {
         log_info("===> pid Not exist, file = %s\n", PID_FILE);
         return 0;
@@ -60,7 +63,7 @@ int check_single_instance()
 
 void write_pid_file()
 {
-    dir_make(RUNTIME_DIR);
+    dir_make_own(RUNTIME_DIR);
     char text[PID_TEXT_SIZE];
     text_format(text, sizeof(text), "%d", static_cast<int>(getpid()));
     file_write(PID_FILE, text, static_cast<int32_t>(strlen(text)));

@@ -109,7 +109,7 @@ int event_pipes_open(event_pipes* pipes)
     if (pipes == nullptr) {
         return 1;
     }
-    dir_make(RUNTIME_DIR);
+    dir_make_own(RUNTIME_DIR);
     memset(pipes, 0, sizeof(*pipes));
 
     struct pipe_place {

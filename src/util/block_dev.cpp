@@ -44,7 +44,7 @@ uint64_t to_number(const char* text)
 void query_blkid(const char* command, const char* dev_name, const char* key, char* out, size_t size)
 {
     memset(out, 0, size);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_BLKID_VALUE);
 
     char* text = file_read_all(SCRATCH_BLKID_VALUE);
     // The key matches anywhere, so a longer key that ends the same and stands first wins.
@@ -62,7 +62,7 @@ void query_blkid(const char* command, const char* dev_name, const char* key, cha
 
 int dev_name_is_disk(const char* name)
 {
-    if (name == nullptr || strlen(name) < MIN_NAME_LENGTH) {
+    if (name == nullptr || strlen(name) < MIN_NAME_LENGTH || !name_is_shell_safe(name)) {
         return 1;
     }
     for (const char* prefix : {"sd", "hd", "mmcblk"}) {
@@ -191,7 +191,7 @@ int script_get_label(const char* dev_name, char* out, size_t size)
     file_delete(SCRATCH_LABEL);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "%s %s > %s", LABEL_SCRIPT, dev_name, SCRATCH_LABEL);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_LABEL);
 
     char text[LABEL_TEXT_SIZE + 1]{};
     if (file_read_buf(SCRATCH_LABEL, text, LABEL_TEXT_SIZE) != 0) {

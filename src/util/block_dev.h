@@ -5,8 +5,8 @@
 #include <cstddef>
 #include <cstdint>
 
-// 0 when the daemon handles devices of that name: at least 3 characters, beginning with "sd" or
-// "hd", or beginning with "mmcblk". Else 1.
+// 0 when the daemon handles devices of that name: at least 3 characters, beginning with "sd",
+// "hd" or "mmcblk", and fit for a shell command. Else 1.
 int dev_name_is_disk(const char* name);
 
 // 0 when name is a whole disk, that is an entry of /sys/block, else 1.

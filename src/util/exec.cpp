@@ -5,6 +5,7 @@
 #include <cstdlib>
 
 #include "log/log.h"
+#include "util/claim.h"
 
 namespace {
 
@@ -16,10 +17,13 @@ constexpr int TERMINATED_BY_SIGNAL_MASK = 0x7F;
 
 int run_system(const char* command)
 {
-    const auto previous = signal(SIGCHLD, SIG_DFL);
+    struct sigaction standard {};
+    struct sigaction previous {};
+    standard.sa_handler = SIG_DFL;
+    const bool changed = sigaction(SIGCHLD, &standard, &previous) == 0;
     const int status = system(command);
-    if (previous != SIG_ERR) {
-        signal(SIGCHLD, previous);
+    if (changed) {
+        sigaction(SIGCHLD, &previous, nullptr);
     }
     return status;
 }
@@ -42,4 +46,12 @@ int exec_cmd(const char* command, int attempts, const char* file, int line)
         log_print_stdout("%s(%d)exec cmd = %s, ret = %d\n", file, line, command, status);
     }
     return 1;
+}
+
+int exec_cmd_into(const char* command, const char* path, const char* file, int line)
+{
+    if (claim_file(path) != 0) {
+        return 1;
+    }
+    return exec_cmd(command, 1, file, line);
 }

@@ -7,5 +7,11 @@
 int exec_cmd(const char* command, int attempts, const char* file = __builtin_FILE(),
              int line = __builtin_LINE());
 
+// exec_cmd, once, of a command that redirects its output into the scratch file at path. An empty
+// file of ours takes the place of whatever lies there first, so that the shell follows no planted
+// link. 1 also when that file cannot be made.
+int exec_cmd_into(const char* command, const char* path, const char* file = __builtin_FILE(),
+                  int line = __builtin_LINE());
+
 // system() with the default SIGCHLD handling for its duration; the raw wait status.
 int run_system(const char* command);

@@ -8,12 +8,14 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/claim.h"
 #include "util/exec.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr mode_t PRIVATE_MODE = 0600;
+constexpr int DIR_MAKE_TRIES = 8;
 
 // A descriptor that closes itself.
 struct fd_guard {
@@ -266,6 +268,21 @@ int dir_make(const char* path)
     const int ret = exec_cmd(command, 1);
     free(command);
     return ret;
+}
+
+int dir_make_own(const char* path)
+{
+    for (int i = 0; i < DIR_MAKE_TRIES; ++i) {
+        if (claim_path(path) != 0) {
+            return 1;
+        }
+        const int ret = dir_make(path);
+        // Making is content with what somebody else made a moment earlier.
+        if (!path_is_foreign(path)) {
+            return ret;
+        }
+    }
+    return 1;
 }
 
 int fifo_create_open(const char* path)

@@ -60,6 +60,9 @@ int file_delete(const char* path);
 // mkdir -p; anything that exists at path counts as success. No single quote may stand in path.
 int dir_make(const char* path);
 
+// dir_make of a directory in /tmp that must be ours: somebody else's is moved aside first.
+int dir_make_own(const char* path);
+
 // Makes the FIFO (mode 0600) when path is missing and opens it for reading and writing without
 // blocking, so that it never reports end-of-file. The caller owns the descriptor; -1 on failure.
 int fifo_create_open(const char* path);

@@ -9,9 +9,11 @@ namespace {
 
 constexpr size_t MOUNT_BASE_LENGTH = sizeof(MOUNT_BASE) - 1;
 
-constexpr char DEV_NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
-                                       "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
-                                       "0123456789._-!";
+// The slash first: a name is a path without it.
+constexpr char PATH_CHARACTERS[] = "/abcdefghijklmnopqrstuvwxyz"
+                                   "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                   "0123456789._-!";
+constexpr const char* NAME_CHARACTERS = PATH_CHARACTERS + 1;
 
 }  // namespace
 
@@ -71,10 +73,15 @@ bool mount_path_is_usable(const char* path)
         return false;
     }
     const char* name = path + MOUNT_BASE_LENGTH + 1;
-    return name[0] != '\0' && name[0] != '.' && dev_name_is_shell_safe(name);
+    return name[0] != '\0' && name[0] != '.' && name_is_shell_safe(name);
 }
 
-bool dev_name_is_shell_safe(const char* name)
+bool name_is_shell_safe(const char* name)
 {
-    return name[strspn(name, DEV_NAME_CHARACTERS)] == '\0';
+    return name[strspn(name, NAME_CHARACTERS)] == '\0';
+}
+
+bool path_is_shell_safe(const char* path)
+{
+    return path[strspn(path, PATH_CHARACTERS)] == '\0';
 }

@@ -65,4 +65,7 @@ bool mount_path_is_usable(const char* path);
 
 // True when name holds nothing but what kernel device names are made of: letters, digits, and the
 // characters . _ - and !. Only such a name may become part of a shell command.
-bool dev_name_is_shell_safe(const char* name);
+bool name_is_shell_safe(const char* name);
+
+// The same of a whole path.
+bool path_is_shell_safe(const char* path);

@@ -13,7 +13,7 @@ int proc_pid_of(const char* name)
     file_delete(SCRATCH_PIDOF);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "pidof %s > %s", name, SCRATCH_PIDOF);
-    exec_cmd(command, 1);
+    exec_cmd_into(command, SCRATCH_PIDOF);
 
     char* text = file_read_all(SCRATCH_PIDOF);
     if (text == nullptr) {

@@ -168,6 +168,14 @@ TEST(DevNameIsDisk, RefusesEveryOtherName)
     EXPECT_EQ(dev_name_is_disk(nullptr), 1);
 }
 
+TEST(DevNameIsDisk, RefusesNamesThatAShellWouldRead)
+{
+    for (const char* name :
+         {"sda;reboot", "sd$(reboot)", "sda 1", "sda`x`", "mmcblk0|x", "sda/1"}) {
+        EXPECT_EQ(dev_name_is_disk(name), 1) << name;
+    }
+}
+
 TEST_F(SysBlock, WholeDisksAreItsEntries)
 {
     make_dir("/sys/block/sda/sda1");

@@ -177,6 +177,26 @@ TEST(RunSystem, HoldsTheHandlerBackAndPutsItInAgain)
               0);
 }
 
+TEST(RunSystem, PutsTheHandlerBackWithItsFlagsAndMask)
+{
+    EXPECT_EQ(in_child([] {
+                  struct sigaction ours {};
+                  ours.sa_sigaction = [](int, siginfo_t*, void*) {};
+                  ours.sa_flags = SA_SIGINFO | SA_RESTART;
+                  sigaddset(&ours.sa_mask, SIGHUP);
+                  sigaction(SIGCHLD, &ours, nullptr);
+                  run_system("true");
+                  struct sigaction now {};
+                  sigaction(SIGCHLD, nullptr, &now);
+                  const int wanted = SA_SIGINFO | SA_RESTART;
+                  if (now.sa_sigaction != ours.sa_sigaction || (now.sa_flags & wanted) != wanted) {
+                      return 1;
+                  }
+                  return sigismember(&now.sa_mask, SIGHUP) == 1 ? 0 : 2;
+              }),
+              0);
+}
+
 TEST(Pause, LastsItsSecondsAlsoWhenSignalsArrive)
 {
     EXPECT_EQ(in_child([] {

@@ -320,6 +320,17 @@ TEST_F(LogFile, IsNamedAfterTheTimeWithoutLeadingZeros)
     EXPECT_EQ(log_files().size(), 1U);
 }
 
+TEST_F(LogFile, ALinkUnderItsNameIsNotFollowed)
+{
+    support::make_dir("/tmp/log");
+    const time_t now = time(nullptr);
+    for (time_t when = now; when < now + 3; ++when) {
+        std::filesystem::create_symlink("/tmp/log/victim", dated_log_path(when));
+    }
+    capture_stdout([] { EXPECT_EQ(log_file_open(), 1); });
+    EXPECT_FALSE(std::filesystem::exists("/tmp/log/victim"));
+}
+
 TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
 {
     std::string text =

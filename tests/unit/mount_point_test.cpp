@@ -228,6 +228,18 @@ TEST_F(MountPoint, the_forced_unmount_names_each_device_and_then_its_path)
                              "umount -f /dev/mmcblk0p1", "umount -f /tmp/mountd/disk2_part1"}));
 }
 
+TEST_F(MountPoint, names_in_the_mount_table_that_a_shell_would_read_reach_no_command)
+{
+    add_mount("/dev/sd;touch$IFS/run/harm;", "/tmp/mountd/disk1_part1");
+    add_mount("/dev/sdb1", "/home/u/tmp/mountd/$(touch$IFS/run/harm)");
+    add_mount("/dev/sdc1", "/tmp/mountd/a\\040b");
+    const std::string log = capture_stdout([] { umount_all_force(); });
+    EXPECT_EQ(actions(), (std::vector<std::string>{"umount -f /tmp/mountd/disk1_part1",
+                                                   "umount -f /dev/sdb1", "umount -f /dev/sdc1"}));
+    EXPECT_TRUE(contains(log, "]umount err, target = /dev/sd;touch$IFS/run/harm;\n")) << log;
+    EXPECT_FALSE(std::filesystem::exists("/run/harm"));
+}
+
 TEST_F(MountPoint, null_arguments_are_answered_with_1)
 {
     EXPECT_EQ(set_all_mount_point_num(nullptr), 1);

@@ -261,7 +261,8 @@ TEST_F(Mount, a_remembered_path_that_is_not_ours_is_overwritten_and_reaches_no_c
         sqlite3_close(db);
 
         part_info* part = put_ready_part(0, 1, "U-1");
-        mount_part(part);
+        const std::string log = capture_stdout([&] { mount_part(part); });
+        EXPECT_TRUE(contains(log, "]remembered path err, uid = U-1, mount = ")) << log;
         EXPECT_STREQ(part->mount_path, "/tmp/mountd/disk1_part1") << path;
         EXPECT_EQ(remembered("U-1"), "sda1 disk1_part1 /tmp/mountd/disk1_part1 yes") << path;
     }

@@ -97,6 +97,20 @@ TEST_F(Removal, further_attempts_end_when_the_device_is_gone_and_use_the_path_of
     EXPECT_EQ(support_disk::the_clock.slept, 2);
 }
 
+TEST_F(Removal, a_listed_path_that_a_shell_would_read_reaches_no_command)
+{
+    part_info part{};
+    text_copy(part.dev_name, "sda1");
+    add_mount("/dev/sda1", "/home/u/tmp/mountd/x;touch$IFS/run/harm");
+    support::write_file(support_disk::UMOUNT_BUSY, std::string(50, 'x'));
+    const std::string log = capture_stdout([&] { umount_part(&part); });
+    for (const std::string& call : actions()) {
+        EXPECT_EQ(call, "umount /dev/sda1");
+    }
+    EXPECT_TRUE(contains(log, "]umount err, target = /home/u/tmp/mountd/x;touch")) << log;
+    EXPECT_FALSE(std::filesystem::exists("/run/harm"));
+}
+
 TEST_F(Removal, removing_a_disk_unmounts_its_slots_in_order_then_the_root_and_zeroes_the_entry)
 {
     put_mounted_disk(1, "sdb", {5, 0, 2});

@@ -46,6 +46,16 @@ TEST_F(SingleInstance, a_listed_pid_is_another_instance_and_its_file_stays)
     EXPECT_EQ(stubs.calls(), std::vector<std::string>{"pgrep -f tarn_nas_diskmanager"});
 }
 
+TEST_F(SingleInstance, a_pid_file_in_somebody_elses_directory_counts_for_nothing)
+{
+    write_file(PID_FILE, "1");
+    ASSERT_EQ(chown("/tmp/tarn_nas", 4711, 4711), 0);
+    list_pids("1\n");
+    EXPECT_EQ(check_single_instance(), 0);
+    EXPECT_FALSE(std::filesystem::exists("/tmp/tarn_nas"));
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
 TEST_F(SingleInstance, a_stale_pid_file_is_deleted_and_start_up_continues)
 {
     write_file(PID_FILE, "999");

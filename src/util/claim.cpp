@@ -1,0 +1,105 @@
+#include "util/claim.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "log/log.h"
+#include "util/paths.h"
+#include "util/text.h"
+
+namespace {
+
+// Somebody may put a new thing there between our steps; nobody can for ever.
+constexpr int CLAIM_TRIES = 100;
+constexpr mode_t PRIVATE_MODE = 0600;
+constexpr char ASIDE_TEMPLATE[] = "/tmp/foreign-XXXXXX";
+
+// A directory that others filled is not deleted: that walk could be led astray. It goes into a
+// directory that only we can enter.
+int move_aside(const char* path)
+{
+    char place[sizeof(ASIDE_TEMPLATE)];
+    text_copy(place, ASIDE_TEMPLATE);
+    if (mkdtemp(place) == nullptr) {
+        log_errno("mkdtemp err, path = %s\n", path);
+        return 1;
+    }
+    char target[PATH_SIZE];
+    text_format(target, sizeof(target), "%s/entry", place);
+    if (rename(path, target) != 0) {
+        log_errno("rename err, path = %s\n", path);
+        rmdir(place);
+        return 1;
+    }
+    log_warn("foreign path %s --> %s\n", path, target);
+    return 0;
+}
+
+// The name itself: behind a slash at its end a link would be followed.
+void text_copy_without_slash(char (&out)[PATH_SIZE], const char* path)
+{
+    text_copy(out, path);
+    const size_t length = strlen(out);
+    if (length > 1 && out[length - 1] == '/') {
+        out[length - 1] = '\0';
+    }
+}
+
+int remove_entry(const char* path)
+{
+    if (unlink(path) == 0 || errno == ENOENT) {
+        return 0;
+    }
+    return rmdir(path) == 0 ? 0 : move_aside(path);
+}
+
+}  // namespace
+
+int claim_file(const char* path)
+{
+    if (path == nullptr) {
+        return 1;
+    }
+    for (int i = 0; i < CLAIM_TRIES; ++i) {
+        if (remove_entry(path) != 0) {
+            return 1;
+        }
+        const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, PRIVATE_MODE);
+        if (fd >= 0) {
+            close(fd);
+            return 0;
+        }
+        if (errno != EEXIST) {
+            break;
+        }
+    }
+    log_errno("claim err, path = %s\n", path);
+    return 1;
+}
+
+bool path_is_foreign(const char* path)
+{
+    if (path == nullptr) {
+        return false;
+    }
+    char name[PATH_SIZE];
+    text_copy_without_slash(name, path);
+    struct stat info {};
+    return lstat(name, &info) == 0 && info.st_uid != geteuid();
+}
+
+int claim_path(const char* path)
+{
+    if (!path_is_foreign(path)) {
+        return 0;
+    }
+    char name[PATH_SIZE];
+    text_copy_without_slash(name, path);
+    return move_aside(name);
+}
