@@ -37,6 +37,11 @@ bool read_block_names(block_names* list)
             text_copy(list->names[used++], name);
         }
     }
+    // Half a list would take the disks that it lacks for pulled ones.
+    if (dir.failed) {
+        log_errno("read dir err, dir = %s\n", SYS_BLOCK);
+        return false;
+    }
     return true;
 }
 

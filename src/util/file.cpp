@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstdlib>
 #include <cstring>
 
@@ -55,7 +56,9 @@ dir_stream::~dir_stream()
 
 const char* dir_stream::next_name()
 {
+    errno = 0;
     const dirent* entry = readdir(stream);
+    failed = entry == nullptr && errno != 0;
     return entry != nullptr ? entry->d_name : nullptr;
 }
 

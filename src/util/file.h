@@ -20,7 +20,11 @@ struct dir_stream {
     dir_stream(const dir_stream&) = delete;
     dir_stream& operator=(const dir_stream&) = delete;
 
-    // The next entry's name, valid until the next call; null after the last.
+    // Reading broke off: what came so far is not the whole directory.
+    bool failed = false;
+
+    // The next entry's name, valid until the next call; null after the last, or when reading
+    // failed.
     const char* next_name();
 };
 
