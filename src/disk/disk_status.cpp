@@ -21,14 +21,25 @@ int write_text(const char* path, const char* text)
     return file_write(path, text, static_cast<int32_t>(strlen(text)));
 }
 
+// Gives the item to the object. What cannot be added is let go: the document gets smaller.
+bool add_item(cJSON* object, const char* key, cJSON* item)
+{
+    if (item != nullptr && cJSON_AddItemToObject(object, key, item) != 0) {
+        return true;
+    }
+    log_err("err!\n");
+    cJSON_Delete(item);
+    return false;
+}
+
 void add_string(cJSON* object, const char* key, const char* value)
 {
-    cJSON_AddItemToObject(object, key, cJSON_CreateString(value));
+    add_item(object, key, cJSON_CreateString(value));
 }
 
 void add_number(cJSON* object, const char* key, double value)
 {
-    cJSON_AddItemToObject(object, key, cJSON_CreateNumber(value));
+    add_item(object, key, cJSON_CreateNumber(value));
 }
 
 void add_part(cJSON* array, part_info* part)
@@ -65,8 +76,9 @@ void fill_disk(cJSON* object, disk_obj* disk)
     log_info("===> get part num = %d\n", part_num);
     add_number(object, "part_num", part_num);
     add_number(object, "sd_card", disk->sd_card);
-    cJSON_AddItemToObject(object, "part", parts);
-
+    if (!add_item(object, "part", parts)) {
+        return;
+    }
     if (disk->root.fs_type != FS_NONE) {
         add_part(parts, &disk->root);
     }
@@ -124,7 +136,10 @@ int disk_status_write_json(disk_sets* sets)
         return 1;
     }
     add_number(root, "disk_number", disk_sets_count(sets));
-    cJSON_AddItemToObject(root, "disk", disks);
+    if (!add_item(root, "disk", disks)) {
+        cJSON_Delete(root);
+        return 1;
+    }
     for (disk_entry& entry : sets->entries) {
         if (entry.in_use == 1) {
             add_disk(disks, &entry.disk);
