@@ -18,7 +18,7 @@ from .daemon import Daemon, child_of
 from .events import PIPES, add_messages, remove_messages, write_pipe
 from .sysfs import Sysfs
 from .syslog import Syslog
-from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools
+from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools, make_busybox
 from .waiting import wait_for
 
 CHECKOUT = Path(__file__).resolve().parents[2]
@@ -41,8 +41,8 @@ def _close_all():
 class World(state.Observed):
     """A private router: its own /tmp, /run, /etc, /dev, /sys/block and processes.
 
-    tools    "" for the distribution's programs, "busybox" for a static busybox
-             as /bin/sh and first in PATH (blkid, pgrep and mount.ntfs-3g stay)
+    tools    "" for the distribution's programs, "busybox" for a router's busybox
+             as /bin/sh and first in PATH (blkid and mount.ntfs-3g stay)
     program  the daemon's binary
     tmp_mib  size of /tmp
     environ  further variables for every process of the world
@@ -61,6 +61,8 @@ class World(state.Observed):
         self._processes = []
         self._keeper = None
         self._busybox = tools == "busybox"
+        if self._busybox:
+            make_busybox()
         _live.add(self)
         try:
             self.keeper_pid = self._start_keeper(tmp_mib)
@@ -327,7 +329,7 @@ class World(state.Observed):
         visible = [place for place in (CHECKOUT, self.program.parent) if place.is_dir()]
         job = {"code": (Path(__file__).parent / "keeper.py").read_text(),
                "visible": [str(place) for place in visible],
-               "shell": BUSYBOX if self._busybox else "", "tmp_mib": tmp_mib}
+               "shell": str(BUSYBOX) if self._busybox else "", "tmp_mib": tmp_mib}
         self._keeper = subprocess.Popen(
             ["unshare", *_NAMESPACES, "--fork", "--kill-child=SIGKILL", "--mount-proc",
              "--propagation", "private", "--", sys.executable, "-I", "-S", "-c", _BOOT],
