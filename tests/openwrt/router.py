@@ -49,6 +49,10 @@ class Buildroot:
         self.make(*(f"install-{package}" for package in packages))
         return self.top / "stage/root"
 
+    def provides(self, package, *words):
+        """Names of libraries that the package's programs may need, by its own account."""
+        return set(self.make(f"provides-{package}", *words).split())
+
 
 class Router:
     """A world on which the staged package lies and the scripts run under busybox ash."""

@@ -1,6 +1,7 @@
 """The feed package: what its Makefile installs, depends on and tells CMake."""
 
 import os
+import subprocess
 
 import pytest
 from router import CHECKOUT, FEED_DIR, PACKAGE
@@ -48,18 +49,42 @@ def test_each_conditional_dependency_has_its_menu_entry(buildroot):
     assert [name for name in conditions if f"config {name}\n" not in menu] == []
 
 
-def test_the_database_survives_an_upgrade(buildroot):
+def kept_over_an_upgrade(root):
+    return (root / "lib/upgrade/keep.d/tarn-nas-diskmanager").read_text().splitlines()
+
+
+def test_the_database_and_the_stand_ins_setting_survive_an_upgrade(buildroot):
     root = buildroot.install(PACKAGE)
     assert buildroot.show(PACKAGE)["CONFFILES"].strip() == "/etc/config/tarn_nas/disk.db"
-    kept = (root / "lib/upgrade/keep.d/tarn-nas-diskmanager").read_text()
-    assert kept == "/etc/config/tarn_nas/\n"
+    assert kept_over_an_upgrade(root) == ["/etc/config/tarn_nas/", "/etc/tarn_utils/"]
 
 
-def test_the_makers_library_takes_the_place_of_the_stand_in(buildroot):
-    named = f"{LIBRARY}=\"/srv/libtarn-utils.so\""
-    assert "-DTARN_UTILS_LIBRARY=/srv/libtarn-utils.so" in buildroot.show(PACKAGE, named)["CMAKE_OPTIONS"]
-    buildroot.make(f"install-{PACKAGE}", named)
-    assert "usr/lib/libtarn-utils.so" not in files(buildroot.top / "stage/root")
+@pytest.fixture
+def makers_library(tmp_path):
+    """Setting that names a library of the maker's, whose version is part of its name for the linker."""
+    library = tmp_path / "libtarn-utils.so"
+    subprocess.run(["cc", "-shared", "-Wl,-soname,libtarn-utils.so.3", "-o", library, "-x", "c", "/dev/null"],
+                   check=True)
+    return f'{LIBRARY}="{library}"'
+
+
+def test_the_makers_library_takes_the_place_of_the_stand_in(buildroot, makers_library):
+    path = makers_library.split('"')[1]
+    assert f"-DTARN_UTILS_LIBRARY={path}" in buildroot.show(PACKAGE, makers_library)["CMAKE_OPTIONS"]
+    buildroot.make(f"install-{PACKAGE}", makers_library)
+    root = buildroot.top / "stage/root"
+    assert "usr/lib/libtarn-utils.so" not in files(root)
+    assert kept_over_an_upgrade(root) == ["/etc/config/tarn_nas/"]
+
+
+def test_the_buildroot_is_told_which_library_the_program_needs(buildroot, makers_library):
+    buildroot.make(f"install-{PACKAGE}", makers_library)
+    assert buildroot.provides(PACKAGE, makers_library) == {"libtarn-utils.so.3"}
+
+
+def test_the_stand_in_is_provided_by_the_package_itself(buildroot):
+    buildroot.install(PACKAGE)
+    assert buildroot.provides(PACKAGE) == {"libtarn-utils.so"}
 
 
 def test_cmake_knows_each_option_that_it_is_given(buildroot):
@@ -80,3 +105,12 @@ def test_the_sources_of_this_tree_are_copied_without_its_builds(buildroot):
     prepared = set(os.listdir(buildroot.top / "stage/build"))
     assert {"CMakeLists.txt", "cmake", "src", "platform"} <= prepared
     assert not {"build", ".git", "tests"} & prepared
+
+
+def test_a_tarball_is_unpacked_into_the_build_directory_whatever_its_top_directory(buildroot, tmp_path):
+    (tmp_path / "release-of-today/src").mkdir(parents=True)
+    (tmp_path / "release-of-today/CMakeLists.txt").touch()
+    subprocess.run(["tar", "-C", tmp_path, "-cJf", tmp_path / "sources.tar.xz", "release-of-today"], check=True)
+    buildroot.make("prepare", f"DL_DIR={tmp_path}", "TARN_SOURCE_TARBALL=sources.tar.xz")
+    assert set(os.listdir(buildroot.top / "stage/build")) == {"CMakeLists.txt", "src"}
+    assert set(os.listdir(buildroot.top / "stage")) == {"build", "install"}

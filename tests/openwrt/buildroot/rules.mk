@@ -7,4 +7,6 @@ INSTALL_DIR:=install -d -m0755
 INSTALL_BIN:=install -m0755
 INSTALL_DATA:=install -m0644
 CP:=cp -fpR
+HOST_TAR:=tar
+TARGET_CROSS:=
 qstrip=$(strip $(subst ",,$(1)))
