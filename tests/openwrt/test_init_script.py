@@ -52,8 +52,7 @@ def test_stop_prints_nothing_and_tells_procd_once(router):
     router.start()
     done = router.service("stop")
     assert done.stdout + done.stderr == ""
-    assert [call for call in router.procd_calls() if call.startswith("kill")] == [
-        "kill tarn_nas_diskmanager"]
+    assert kills(router) == ["kill tarn_nas_diskmanager"]
 
 
 def test_stop_without_a_daemon_is_quick_and_quiet(router):
@@ -111,6 +110,45 @@ def test_the_daemon_can_restart_itself_on_its_way_out(router, mode):
     new = router.wait_ready(but=[old])
     # Long enough for a respawn that procd had in mind.
     time.sleep(4)
+    assert router.pids() == [new]
+    assert router.notes() == ["start", "end", "start"]
+    assert faults(router) == []
+
+
+def kills(router):
+    return [call for call in router.procd_calls() if call.startswith("kill")]
+
+
+def begin(router, action):
+    """Run the init script in the background, until it has told procd to end the service."""
+    before = len(kills(router))
+    script = router.world.popen(INIT, action)
+    wait_for(lambda: len(kills(router)) > before, 10, f"the beginning of {action}")
+    return script
+
+
+def test_a_restart_waits_for_a_stop_that_is_under_way(router):
+    router.mode("slow")
+    old = router.start()
+    stop = begin(router, "stop")
+    restart = router.world.popen(INIT, "restart")
+    time.sleep(1)
+    assert stop.poll() is None
+    assert len(kills(router)) == 1
+    assert stop.wait(20) == 0
+    assert restart.wait(20) == 0
+    router.wait_ready(but=[old])
+    assert router.notes() == ["start", "end", "start"]
+    assert faults(router) == []
+
+
+def test_a_daemon_that_restarts_itself_while_it_is_being_stopped_runs_again_afterwards(router):
+    router.mode("hang")
+    old = router.start()
+    stop = begin(router, "stop")
+    router.world.write("/tmp/restart", "")
+    assert stop.wait(20) == 0
+    new = router.wait_ready(but=[old])
     assert router.pids() == [new]
     assert router.notes() == ["start", "end", "start"]
     assert faults(router) == []

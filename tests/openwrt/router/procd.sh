@@ -1,8 +1,13 @@
+#!/bin/sh
 # shellcheck shell=dash
 # The part of procd that an init script talks to. Every call is noted in /run/procd/calls.
 
 STATE=/run/procd
 mkdir -p "$STATE"
+
+# A service's script runs once at a time: the next one waits here until the last process that has the lock open is gone.
+exec 9>"$STATE/lock"
+flock 9
 
 note() {
 	echo "$*" >>"$STATE/calls"
@@ -44,7 +49,7 @@ procd_close_service() {
 	fi
 	forget_supervisor
 	rm -f "$STATE/halt"
-	setsid /bin/sh /lib/procd_supervise >/dev/null 2>&1 &
+	setsid /bin/sh /lib/procd_supervise >/dev/null 2>&1 9>&- &
 	echo $! >"$STATE/supervisor"
 }
 
