@@ -1,0 +1,183 @@
+"""A storm of signals over a daemon that never rests."""
+
+import json
+import random
+import re
+import signal
+import subprocess
+import sys
+import threading
+import time
+from collections import Counter
+from pathlib import Path
+
+import pytest
+from whole_lines import broken_lines, is_announcement, is_foreign
+
+pytestmark = pytest.mark.needs_fs("ext2")
+
+DISKS = 16
+SIGNALS = {"short": 25_000, "long": 120_000}
+SENDER = Path(__file__).with_name("signal_sender.py")
+MASKS = "/run/world/masks.log"
+MASK_TEXT = """#!/bin/sh
+while read -r key value; do
+    [ "$key" != SigBlk: ] || echo "$value" >> {log}
+done < /proc/self/status
+exec {real} "$@"
+"""
+# Blocked in the daemon's parent, so that "unchanged" is not "empty".
+BLOCKED = signal.SIGWINCH
+REPORTS = {"SIGPIPE": "get sig = SIGPIPE",
+           **{name: f"get sig = {int(getattr(signal, name))}"
+              for name in ("SIGUSR1", "SIGALRM", "SIGHUP", "SIGCHLD")}}
+HANDLED = ("SIGPIPE", "SIGUSR1", "SIGUSR2", "SIGALRM", "SIGHUP", "SIGCHLD", "SIGINT")
+WAITS = ("no event ...", "get event = ")
+
+
+def plug_all(world):
+    """Sixteen small sticks, so that every pass has that many rows, mounts and records."""
+    for number in range(DISKS):
+        world.plug(world.whole_disk("ext2", 4, label=f"S{number}"), f"sd{chr(ord('a') + number)}")
+
+
+def watch_masks(world):
+    """Let blkid and the file services note the mask that they were started with."""
+    world.tools.stub("blkid", MASK_TEXT.format(log=MASKS, real=world.tools.real("blkid")))
+    for name in ("samba4", "tarn_nas_sys_up"):
+        world.tools.init_script(name, MASK_TEXT.format(log=MASKS, real="true"))
+
+
+def start_with_blocked_signal(world):
+    """The daemon from a parent with one signal blocked; returns it and that parent's mask."""
+    before = signal.pthread_sigmask(signal.SIG_BLOCK, {BLOCKED})
+    try:
+        daemon = world.start_daemon(wait=False)
+    finally:
+        signal.pthread_sigmask(signal.SIG_SETMASK, before)
+    return daemon, status_line(daemon.process.pid, "SigBlk")
+
+
+def status_line(pid, key):
+    text = Path(f"/proc/{pid}/status").read_text()
+    return next(line.split()[1] for line in text.splitlines() if line.startswith(key))
+
+
+def wait_handlers(world, daemon):
+    def ready():
+        caught = int(status_line(daemon.outer_pid, "SigCgt"), 16)
+        return all(caught >> (getattr(signal, name) - 1) & 1 for name in HANDLED)
+    world.wait(ready, 20, "the signal handlers")
+
+
+class Bustle(threading.Thread):
+    """Events of all kinds until it is told to stop."""
+
+    def __init__(self, world, seed):
+        super().__init__(daemon=True)
+        self._world, self._random = world, random.Random(seed)
+        self._over = threading.Event()
+        self.sent = 0
+
+    def run(self):
+        while not self._over.wait(self._random.uniform(0, 0.6)):
+            name = f"sd{chr(ord('a') + self._random.randrange(DISKS))}"
+            number = self._random.randrange(1, DISKS + 1)
+            self._world.send(self._random.choice([
+                f"#remove_dev:{name}", f"#add:{name}", f"#add:{name}", "#heart_beat", "#heart_beat",
+                f"#remove_disk:disk{number}_part1", "#nonsense", ""]), timeout=60)
+            self.sent += 1
+
+    def stop(self):
+        self._over.set()
+        self.join(70)
+
+
+def send_sigint_until_told(daemon, told):
+    """One SIGINT more in the log.
+
+    Sent again only when the loop has waited twice without telling of it: the C library discards
+    those that come while a command runs.
+    """
+    while daemon.running and daemon.log().count("get sig = SIGINT") < told:
+        mark = daemon.mark()
+        daemon.signal(signal.SIGINT)
+        for _ in range(2):
+            waits = sum(daemon.log_since(mark).count(text) for text in WAITS)
+            deadline = time.monotonic() + 90
+            while daemon.running and time.monotonic() < deadline and waits >= sum(
+                    daemon.log_since(mark).count(text) for text in WAITS):
+                time.sleep(0.02)
+
+
+def reported(log):
+    """How many signals of each kind the log tells of."""
+    told = Counter(re.findall(r"get sig = \w+", log))
+    return {name: told[text] for name, text in REPORTS.items()}
+
+
+def copied_and_printed(syslog, log):
+    """The lines of syslog, and those of the log that should be there too, from the first on."""
+    copied = [line for message in syslog.messages("tarndisk")
+              for line in message.text.split("\n") if line]
+    printed = [line for line in log.split("\n")
+               if line and not is_announcement(line) and not is_foreign(line)]
+    return copied, printed[-len(copied):]
+
+
+@pytest.mark.parametrize("number", range(1))
+def test_a_storm_of_signals_neither_stops_nor_garbles_anything(
+        make_world, request, is_long, figure, number):
+    seed = request.config.getoption("--seed") or 30_000 + number
+    figure("seed", seed)
+    # A router's shell: that of the distribution clears the mask of what it starts.
+    world = make_world(tools="busybox")
+    if not world.program.exists():
+        pytest.skip(f"{world.program} is not built")
+    syslog = world.syslog()
+    watch_masks(world)
+    plug_all(world)
+    daemon, mask = start_with_blocked_signal(world)
+    assert int(mask, 16) >> (BLOCKED - 1) & 1
+    wait_handlers(world, daemon)
+
+    # The storm begins with the first scan, in which every disk is mounted and remembered.
+    sender = subprocess.Popen(
+        [sys.executable, SENDER, str(daemon.outer_pid),
+         str(SIGNALS["long" if is_long else "short"]), str(seed)],
+        stdout=subprocess.PIPE, text=True)
+    daemon.wait_log("have disk = ", 60)
+    bustle = Bustle(world, seed)
+    bustle.start()
+    send_sigint_until_told(daemon, 1)
+    sent = json.loads(sender.communicate(timeout=900)[0])
+    bustle.stop()
+    assert daemon.running, daemon.log()[-4000:]
+
+    # All disks are there at the end, whatever was removed meanwhile.
+    world.send(*[f"#add:sd{chr(ord('a') + number)}" for number in range(DISKS)],
+               "#heart_beat:last", timeout=60)
+    daemon.wait_log("get event = #heart_beat:last", 300)
+    devices = {f"/dev/sd{chr(ord('a') + number)}" for number in range(DISKS)}
+    world.wait(lambda: set(world.mounted()) == devices, 180, lambda: f"all, not {world.mounted()}")
+    world.wait(lambda: {f"/dev/{name}": part.path for name, part in world.parts().items()}
+               == world.mounted(), 60, "the inventory of all")
+    assert "mount ERROR" not in daemon.log()
+    assert len({row["uid"] for row in world.db_rows()}) == len(world.db_rows()) == DISKS
+    send_sigint_until_told(daemon, 2)
+    assert daemon.wait_exit(60) == 0
+
+    log = daemon.log()
+    told = reported(log)
+    figure("sent", f"{sum(sent.values())} {sent}")
+    figure("told", f"{sum(told.values())} {told}")
+    figure("events, lines of the log", f"{bustle.sent}, {log.count(chr(10))}")
+    assert broken_lines(log) == []
+    assert all(1 <= told[name] <= sent[name] for name in told)
+    assert re.findall(r"get sig = SIGINT, c = (\d+)", log) == ["0", "1"]
+    copied, printed = copied_and_printed(syslog, log)
+    figure("lines in syslog", len(copied))
+    assert len(copied) > 1000 and copied == printed
+    masks = Counter(world.read(MASKS).split())
+    figure("commands whose mask was looked at", masks.total())
+    assert masks.total() > 100 and set(masks) == {mask}
