@@ -1,5 +1,7 @@
 #include "disk/mount_point.h"
 
+#include <cerrno>
+
 #include "disk/mount_table.h"
 #include "log/log.h"
 #include "util/exec.h"
@@ -78,6 +80,13 @@ bool read_for_check(mount_table* table)
 void log_mount(const mount_entry* entry)
 {
     log_info("%s ===> %s\n", entry->dev, entry->path);
+}
+
+// Only a node that is not there is gone. One that cannot be looked at for a moment, for want of
+// memory say, must not cost the database.
+bool node_is_gone(const char* dev_path)
+{
+    return !path_exists(dev_path) && errno == ENOENT;
 }
 
 // Anybody who may mount a userspace filesystem chooses names in the mount table.
@@ -221,7 +230,7 @@ int check_mount_dev_exist()
     for (int i = 0; i < table.num; ++i) {
         const char* dev_path = table.entries[i].dev;
         log_info("check mount dev err, dev[%d] = %s\n", i, dev_path);
-        if (!path_exists(dev_path)) {
+        if (node_is_gone(dev_path)) {
             log_warn("dev not find, dev = %s\n", dev_path);
             return 1;
         }
