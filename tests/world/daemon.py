@@ -45,6 +45,11 @@ class Daemon:
         """Exit status, None while it runs."""
         return self.process.poll()
 
+    def release(self):
+        """Let a daemon that was started held begin."""
+        self.process.stdin.write(b"\n")
+        self.process.stdin.close()
+
     def log(self):
         """All that it and its commands printed so far."""
         return self.log_path.read_text(errors="replace")

@@ -25,6 +25,8 @@ CHECKOUT = Path(__file__).resolve().parents[2]
 PROGRAM = CHECKOUT / "build/release/tarn_nas_diskmanager"
 HOTPLUG_HOOK = "/etc/hotplug.d/block/10-mount"
 _NAMESPACES = ["--mount", "--pid", "--ipc", "--uts"]
+# A shell that turns into the program once it is let go, with the same process id.
+_HOLD = 'read -r go; exec "$0" "$@" < /dev/null'
 _BOOT = "import json,sys; job=json.loads(sys.stdin.readline()); exec(job['code'])"
 # What a router's kernel lists beside the disks; the daemon must pass over them.
 _OTHER_DEVICES = ("loop0", "mtdblock0", "zram0")
@@ -140,19 +142,22 @@ class World(state.Observed):
                                 env={**self._environ, **(environ or {})},
                                 start_new_session=True, **options)
 
-    def start_daemon(self, *options, wait=True, environ=None):
+    def start_daemon(self, *options, wait=True, environ=None, held=False):
         """Start the daemon with its output in a file; returns a Daemon.
 
-        With `wait` its start-up scan is over when this returns.
+        With `wait` its start-up scan is over when this returns.  With `held` it is
+        still a shell that waits for Daemon.release.
         """
+        words = ["/bin/sh", "-c", _HOLD] if held else []
         log_path = self.workdir / f"daemon-{len(self._daemons) + 1}.log"
         with log_path.open("ab") as log:
-            process = self.popen(self.program, *options, environ=environ,
-                                 stdin=subprocess.DEVNULL, stdout=log, stderr=log)
+            process = self.popen(*words, self.program, *options, environ=environ,
+                                 stdin=subprocess.PIPE if held else subprocess.DEVNULL,
+                                 stdout=log, stderr=log)
         self._processes.append(process)
         daemon = Daemon(process, log_path)
         self._daemons.append(daemon)
-        if wait:
+        if wait and not held:
             daemon.wait_started()
         return daemon
 
@@ -293,6 +298,11 @@ class World(state.Observed):
 
     def label_script(self, text):
         """Install the optional label script under its fixed name in /usr/bin."""
+        self.cover_usr_bin()
+        self.write(LABEL_SCRIPT, text, 0o755)
+
+    def cover_usr_bin(self):
+        """Make /usr/bin the world's own to change."""
         upper = "/run/world/usr-bin"
         self.run("mkdir", "-p", f"{upper}/upper", f"{upper}/work")
         self.run("mount", "-t", "overlay", "overlay", "/usr/bin", "-o",
@@ -300,7 +310,6 @@ class World(state.Observed):
         if self._busybox:
             shell = self.run("readlink", "-f", "/bin/sh").stdout.strip()
             self.run("mount", "--bind", BUSYBOX, shell)
-        self.write(LABEL_SCRIPT, text, 0o755)
 
     # The end.
 

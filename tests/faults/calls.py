@@ -1,0 +1,86 @@
+"""The system calls that the daemon makes itself, and the errors that each can end with.
+
+Which calls these are is not believed but looked up: a test traces a start and a
+whole cycle and finds every call either in CALLS or in CANNOT_FAIL.
+"""
+
+import re
+from dataclasses import dataclass
+
+
+@dataclass(frozen=True)
+class Call:
+    """One kind of call.
+
+    names    the kernel's names for it, on whatever processor
+    errors   what a kernel can really return for it
+    hides    its failure can hide a device's data, so the device is left out, or
+             recorded with gaps, until it is announced again
+    stages   it is made at start-up, in a running cycle, or in both
+    rare     once or twice in a cycle
+    """
+
+    names: tuple
+    errors: tuple
+    hides: bool = False
+    stages: tuple = ("start", "cycle")
+    rare: bool = False
+
+    @property
+    def name(self):
+        return self.names[0]
+
+
+CALLS = (
+    Call(("openat", "open"), ("EMFILE", "ENOMEM", "EACCES", "EIO", "ENOSPC", "EINTR"), hides=True),
+    Call(("read",), ("EIO", "EAGAIN", "EINTR"), hides=True),
+    # EAGAIN where the reader of the output is slow and made its pipe non-blocking.
+    Call(("write",), ("ENOSPC", "EIO", "EAGAIN", "EINTR")),
+    Call(("close",), ("EIO", "EINTR")),
+    Call(("access", "faccessat", "faccessat2"), ("ENOMEM", "EACCES", "EIO"), hides=True),
+    Call(("newfstatat", "fstat", "stat", "lstat", "statx"), ("ENOMEM", "EACCES", "EIO"),
+         hides=True),
+    Call(("getdents64",), ("EIO", "ENOMEM"), hides=True),
+    Call(("lseek",), ("EIO",), hides=True, rare=True),
+    Call(("readlink", "readlinkat"), ("ENOMEM", "EACCES", "EIO"), stages=("cycle",),
+         rare=True),
+    Call(("statfs",), ("EIO", "EACCES", "ENOMEM", "EINTR")),
+    # A scratch file that cannot be claimed is not written to.
+    Call(("unlink", "unlinkat"), ("EIO", "EACCES", "ENOSPC", "ENOMEM"), hides=True),
+    Call(("mknodat", "mknod"), ("ENOSPC", "EACCES", "EIO", "ENOMEM"), stages=("start",)),
+    Call(("pread64",), ("EIO", "EINTR")),
+    Call(("pwrite64",), ("ENOSPC", "EIO", "EINTR")),
+    Call(("fdatasync", "fsync"), ("EIO", "ENOSPC", "EINTR")),
+    Call(("fcntl",), ("EAGAIN", "EACCES", "ENOMEM", "EINTR")),
+    Call(("fchown",), ("EIO", "ENOSPC"), rare=True),
+    # The stack of the helper that becomes the shell, stdio's and malloc's memory.
+    Call(("mmap",), ("ENOMEM",), hides=True),
+    Call(("munmap",), ("ENOMEM",)),
+    # malloc's and SQLite's random numbers, before the kernel has gathered any.
+    Call(("getrandom",), ("EAGAIN",), stages=("start",)),
+    # A shell that cannot be started.
+    Call(("clone3", "clone", "vfork", "fork"), ("EAGAIN", "ENOMEM"), hides=True),
+    Call(("wait4", "waitid"), ("EINTR",)),
+    Call(("pselect6", "select"), ("EINTR", "ENOMEM")),
+    Call(("clock_nanosleep", "nanosleep"), ("EINTR",)),
+)
+
+# Calls without an error that a correct program can meet; brk has none at all, it
+# answers with the old break, and malloc goes on with mmap.
+CANNOT_FAIL = {"rt_sigaction", "rt_sigprocmask", "rt_sigreturn", "getpid", "geteuid", "brk",
+               "exit_group", "restart_syscall", "clock_gettime", "futex", "mprotect"}
+
+_CALL = re.compile(r"^(\w+)\(")
+
+
+def names_in(trace):
+    """Names of the calls in a trace, in order."""
+    return [match.group(1) for match in map(_CALL.match, trace.splitlines()) if match]
+
+
+def known_names():
+    return {name for call in CALLS for name in call.names} | CANNOT_FAIL
+
+
+def of_stage(stage):
+    return [call for call in CALLS if stage in call.stages]

@@ -1,0 +1,74 @@
+"""Fixtures of the tests with faults: those of the system tests, the long form, and the count."""
+
+import sys
+from collections import Counter
+from pathlib import Path
+
+HERE = Path(__file__).resolve().parent
+sys.path[:0] = [str(HERE), str(HERE.parent)]
+
+import pytest  # noqa: E402
+
+import preload  # noqa: E402
+from rig import Rig  # noqa: E402
+from system.conftest import (  # noqa: E402, F401
+    daemon, make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
+    pytest_runtest_setup, start_daemon, world)
+
+_INJECTED = "injected"
+_OUTCOME = "outcome"
+
+
+def pytest_addoption(parser):
+    parser.addoption("--long", action="store_true",
+                     help="every occurrence of every call and allocation; takes an hour")
+
+
+def pytest_terminal_summary(terminalreporter):
+    """The figures: what failed how often in which stage, and what came of the starts."""
+    reports = [report for some in terminalreporter.stats.values() for report in some
+               if getattr(report, "when", "") == "call"]
+    for property_name, title in ((_INJECTED, "faults injected"), (_OUTCOME, "starts")):
+        totals = Counter()
+        for report in reports:
+            for name, (what, times) in report.user_properties:
+                if name == property_name:
+                    totals[what] += times
+        if totals:
+            terminalreporter.section(title)
+            for what, times in [*sorted(totals.items()), ("in all", totals.total())]:
+                terminalreporter.write_line(f"{what:44} {times:7}")
+
+
+@pytest.fixture
+def long_form(request):
+    """True when everything is wanted."""
+    return request.config.getoption("--long")
+
+
+@pytest.fixture
+def count(request):
+    """Function that notes for the summary what failed and how often."""
+    def note(what, times):
+        request.node.user_properties.append((_INJECTED, (what, times)))
+    return note
+
+
+@pytest.fixture
+def outcome(request):
+    """Function that notes for the summary how many starts ended how."""
+    def note(what, times):
+        request.node.user_properties.append((_OUTCOME, (what, times)))
+    return note
+
+
+@pytest.fixture(scope="session")
+def libraries(tmp_path_factory):
+    """The folder of the libraries to preload."""
+    return preload.build(tmp_path_factory.mktemp("preload"))
+
+
+@pytest.fixture
+def rig(world, start_daemon, libraries):  # noqa: F811
+    """Two disks mounted, published and remembered, the first rescan over; a hastened daemon."""
+    return Rig(world, environ=preload.install(world, libraries, "haste"))

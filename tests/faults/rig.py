@@ -1,0 +1,148 @@
+"""Two disks and a daemon on which faults are tried, and what must be right again afterwards."""
+
+import sqlite3
+import time
+from contextlib import closing
+from pathlib import Path
+
+from preload import HASTE
+
+from world import DaemonGone, Partition, WaitTimeout, add_messages
+from world.state import DISK_DB
+
+HEART_BEAT = "===> get event = EVENT_DISK_HEART_BEAT"
+BOUND = 90
+RECOVERY = 45
+# A rescan comes in the first cycle that ends 8 s or more after the last.
+WINDOW = (8 + 3 + 2 + 1) / HASTE
+AFTER_SAFE_REMOVAL = 0.7
+
+
+class Rig:
+    """A world with two partitioned disks; what is right is what the first start made."""
+
+    def __init__(self, world, **options):
+        self.world = world
+        self.disks = [world.partitioned_disk(Partition("ext4", 1200, "KEPT")),
+                      world.partitioned_disk(Partition("ext4", 1100, "MOVED"))]
+        for disk, name in zip(self.disks, ("sda", "sdb"), strict=True):
+            world.plug(disk, name)
+        world.start_companion()
+        self.daemon = world.start_daemon(**options)
+        self.fds = None
+        world.wait(lambda: len(world.parts()) == 2, 30, "two partitions in disk.json")
+        self.daemon.wait_rescan()
+        self.published = self._published()
+        self.fds = sorted(self.daemon.fds().values())
+
+    # What a cycle is made of.
+
+    def busy_cycle(self):
+        """All that a cycle can hold: removal, addition, mount, publication, rescan, safe removal."""
+        moved = self.disks[1]
+        begun = time.monotonic()
+        self.world.send(f"#remove_dev:{moved.name}1", *add_messages(moved))
+        time.sleep(max(0, begun + WINDOW - time.monotonic()))
+        # Nothing was said of the other disk.
+        assert self.world.mounted().get("/dev/sda1") == self.paths()["/dev/sda1"]
+        self.world.safe_remove()
+        time.sleep(AFTER_SAFE_REMOVAL)
+
+    def replug(self):
+        """The disks go and come again, as far as the daemon is told.
+
+        A disk that the daemon could not unmount while it was to forget it stays
+        mounted; on a router it goes with the device.
+        """
+        for disk in self.disks:
+            self.world.send(f"#remove_dev:{disk.name}")
+        self.answer()
+        for entry in self.world.mounts():
+            self.world.run("umount", entry.path)
+        for disk in self.disks:
+            self.world.send(*add_messages(disk))
+
+    def answer(self):
+        """Wait until the daemon has read all that was sent: it does not hang."""
+        mark = self.daemon.mark()
+        self.world.send("#heart_beat")
+        self.daemon.wait_log(HEART_BEAT, BOUND, mark)
+
+    # What must hold.
+
+    def check(self, fds_kept_open=0):
+        """After a fault: alive, no descriptor lost, and with the next plug all is right."""
+        assert self.daemon.running, f"ended with {self.daemon.returncode}"
+        self.answer()
+        self.replug()
+        self.wait_right()
+        self.check_process(fds_kept_open)
+
+    def check_process(self, fds_kept_open=0):
+        """No descriptor and no child is left over."""
+        self.world.wait(lambda: len(self.daemon.fds()) == len(self.fds) + fds_kept_open, 10,
+                        lambda: f"descriptors {self.fds}, where {self.daemon.fds()} are open")
+        children = Path(f"/proc/{self.daemon.outer_pid}/task/{self.daemon.outer_pid}/children")
+        self.world.wait(lambda: children.read_text() == "", 10, "no child of the daemon")
+
+    def wait_right(self, timeout=RECOVERY):
+        """Wait until inventory, mounts, files and rows are as they must be."""
+        try:
+            self.world.wait(lambda: not self.wrong(), timeout, "")
+        except WaitTimeout:
+            if not self.daemon.running:
+                raise DaemonGone(f"ended with {self.daemon.returncode}") from None
+            raise AssertionError(f"after {timeout} s: {self.wrong()}") from None
+
+    def wrong(self):
+        """What is not right, as a text; empty when all is."""
+        parts = self._published()
+        if parts != self.published:
+            return f"disk.json holds {parts}, not {self.published}"
+        if self.world.disk_num() != str(len(self.disks)):
+            return f"disk_num.txt holds {self.world.disk_num()}"
+        if any(part.free_size == 0 for part in self.world.parts().values()):
+            return "disk.json lacks the free space"
+        if self.world.mounted() != self.paths():
+            return f"{self.world.mounted()} is mounted, not {self.paths()}"
+        return database_fault(self.world) or self._wrong_rows()
+
+    def paths(self):
+        """{device path: mount path} as it must be."""
+        return {f"/dev/{name}": f"/tmp/mountd/{values[0]}"
+                for name, values in self.published.items()}
+
+    def _published(self):
+        return {name: (part.disk_name, part.fs_type, part.uid, part.label, part.total_len)
+                for name, part in self.world.parts().items()}
+
+    def _wrong_rows(self):
+        rows = {row["uid"]: row for row in self.world.db_rows()}
+        for name, (directory, _, uid, _, _) in self.published.items():
+            if uid not in rows:
+                return f"no row of {name}"
+            if (rows[uid]["disk_name"], rows[uid]["mountd"]) != (directory, "yes"):
+                return f"row of {name}: {rows[uid]}"
+        return ""
+
+
+def database_fault(world):
+    """What is wrong with the database file as it is now, as a text; empty when nothing is.
+
+    A journal that a fault left behind is SQLite's to play back, so it is read with it.
+    """
+    if not world.exists(DISK_DB) or not world.path(DISK_DB).stat().st_size:
+        return ""
+    copy = Path(world.workdir) / "copy.db"
+    for suffix in ("", "-journal"):
+        target = Path(f"{copy}{suffix}")
+        target.unlink(missing_ok=True)
+        if world.exists(DISK_DB + suffix):
+            target.write_bytes(world.path(DISK_DB + suffix).read_bytes())
+    with closing(sqlite3.connect(copy)) as database:
+        verdict = [row[0] for row in database.execute("pragma integrity_check")]
+        if verdict != ["ok"]:
+            return f"integrity_check: {verdict}"
+        twice = database.execute(
+            "select uid from disk group by uid having count(*) > 1").fetchall()
+        return f"rows of {twice} more than once" if twice else ""

@@ -1,0 +1,123 @@
+"""Every allocation in SQLite, in cJSON and of the daemon itself fails."""
+
+import pytest
+from allocations import CJSON, OWN, SQLITE, Allocations
+from preload import install
+from rig import Rig, database_fault
+
+from world import Partition
+from world.state import DISK_DB
+
+# A cycle of a tenth of a second: the sweeps take many.
+HASTE = 30
+# Swap has no mount command: such a partition is looked up in the database and entered
+# there in every mount pass, with no wait for a mount.
+SWAPS = 8
+SWEEP_END = 240
+CLEAN = 6
+
+
+@pytest.fixture
+def prepared(world, start_daemon, libraries):
+    """(world, switch, environment) of a daemon whose allocations can fail."""
+    environ = install(world, libraries, "haste", "alloc", haste=HASTE)
+    return world, Allocations(world), environ
+
+
+def wait_swept(world, daemon, allocations, meanwhile=lambda: None):
+    """Wait until the sweep has reached operations that end before the allocation to fail."""
+    def swept():
+        assert daemon.running, f"ended with {daemon.returncode}"
+        meanwhile()
+        last = allocations.operations()[-CLEAN:]
+        return len(last) == CLEAN and not any(operation.failed for operation in last)
+    world.wait(swept, SWEEP_END, lambda: f"the end of the sweep; {allocations.operations()[-5:]}")
+    allocations.disarm()
+    return allocations.operations()
+
+
+@pytest.mark.needs_fs("ext4")
+@pytest.mark.parametrize("from_on", [False, True], ids=["one", "all-from-it-on"])
+def test_publication_survives_each_allocation_that_fails_in_it(prepared, count, from_on):
+    world, allocations, environ = prepared
+    rig = Rig(world, environ=environ)
+    allocations.arm(CJSON, from_on=from_on)
+    done = wait_swept(world, rig.daemon, allocations)
+    count(f"cJSON  {'all from the Nth on' if from_on else 'the Nth'}",
+          sum(operation.failed for operation in done))
+    assert [operation for operation in done if operation.left] == []
+    rig.wait_right(2)
+    rig.check()
+    assert rig.daemon.stop() == 0
+
+
+def swap_disks(world):
+    return [world.partitioned_disk(*[Partition("swap", 1001 + number, f"S{number}")
+                                     for number in range(SWAPS)]) for _ in range(2)]
+
+
+@pytest.mark.parametrize("from_on", [False, True], ids=["one", "all-from-it-on"])
+@pytest.mark.parametrize("fresh", [False, True], ids=["known", "fresh"])
+def test_database_survives_each_allocation_that_fails_in_it(prepared, count, from_on, fresh):
+    world, allocations, environ = prepared
+    for disk, name in zip(swap_disks(world), ("sda", "sdb"), strict=True):
+        world.plug(disk, name)
+    world.start_companion()
+    daemon = world.start_daemon(environ=environ)
+    world.wait(lambda: len(world.db_rows()) == 2 * SWAPS, 30, "a row for each partition")
+    before = world.db_rows()
+
+    def forget_rows():
+        fault = database_fault(world)
+        assert not fault, fault
+        if fresh:
+            world.path(DISK_DB).unlink(missing_ok=True)
+
+    # Reading a row is one operation and writing it another, so each number comes twice
+    # and more, with the table or the row there already and not.
+    allocations.arm(SQLITE, repeat=4, from_on=from_on)
+    done = wait_swept(world, daemon, allocations, forget_rows)
+    assert [operation for operation in done if operation.left] == []
+    count(f"SQLite {'all from the Nth on' if from_on else 'the Nth'}, "
+          f"{'no rows yet' if fresh else 'rows there'}",
+          sum(operation.failed for operation in done))
+    world.wait(lambda: len(world.db_rows()) == 2 * SWAPS, 20, "all rows again")
+    assert not database_fault(world)
+    if not fresh:
+        assert world.db_rows() == before
+    assert daemon.stop() == 0
+
+
+@pytest.mark.needs_fs("ext4")
+def test_memory_that_stays_short_is_survived_in_every_library(
+        world, start_daemon, libraries, count):
+    environ = install(world, libraries, "haste", "alloc")
+    allocations = Allocations(world)
+    rig = Rig(world, environ=environ)
+    for kind, name in ((SQLITE, "SQLite"), (CJSON, "cJSON")):
+        allocations.arm(kind, step=0, from_on=True)
+        rig.busy_cycle()
+        allocations.disarm()
+        failed = sum(operation.failed for operation in allocations.operations())
+        assert failed > 0
+        count(f"{name} all of a cycle", failed)
+        rig.check()
+    assert rig.daemon.stop() == 0
+
+
+@pytest.mark.needs_fs("ext4")
+def test_own_allocations_that_fail_in_a_cycle_are_survived(
+        world, start_daemon, libraries, count, long_form):
+    environ = install(world, libraries, "haste", "alloc")
+    allocations = Allocations(world)
+    rig = Rig(world, environ=environ)
+    steps = (1, 2, 3, 5, 7) if long_form else (1, 2, 3)
+    for step in steps:
+        for first in range(1, step + 1):
+            allocations.arm(OWN, first=first, every=step)
+            rig.busy_cycle()
+            allocations.disarm()
+            assert allocations.own_failed > 0
+            count("own    every so many-th of a cycle", allocations.own_failed)
+            rig.check()
+    assert rig.daemon.stop() == 0

@@ -1,0 +1,61 @@
+"""Every system call of a running daemon fails: in removal, addition, mount, idle work, rescan
+and safe removal."""
+
+import pytest
+from calls import known_names, names_in, of_stage
+from strace import Strace
+
+pytestmark = pytest.mark.needs_fs("ext4")
+
+# Which occurrences of a call fail, as first and step.  Code that repeats a call after
+# EINTR must meet one that is not interrupted, so that error never takes them all.
+SHORT = ("1+2", "1+1", "2+3", "1+3")
+LONG = tuple(f"{first}+{step}" for step in (1, 2, 3, 5, 7) for first in range(1, step + 1))
+_PER_TEST = 3
+
+
+def cases():
+    """(call, its next few errors): the faults that one daemon lives through."""
+    for call in of_stage("cycle"):
+        for first in range(0, len(call.errors), _PER_TEST):
+            yield pytest.param(call, call.errors[first:first + _PER_TEST],
+                               id=f"{call.name}-{'-'.join(call.errors[first:first + _PER_TEST])}")
+
+
+def patterns(call, error, long_form):
+    """The occurrences to let fail; the short form takes one pattern, not always the same."""
+    if long_form:
+        return [when for when in LONG if not (error == "EINTR" and when == "1+1")]
+    if error == "EINTR" or call.rare:
+        return ["1+2"]
+    return [SHORT[call.errors.index(error) % len(SHORT)]]
+
+
+def test_every_call_of_a_cycle_is_known(rig):
+    with Strace(rig.daemon) as strace:
+        rig.busy_cycle()
+        rig.replug()
+        rig.wait_right()
+    seen = names_in(strace.trace)
+    assert set(seen) - known_names() == set()
+    missed = [call.name for call in of_stage("cycle") if not set(call.names) & set(seen)]
+    assert missed == []
+
+
+@pytest.mark.parametrize("call, errors", cases())
+def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
+        rig, count, long_form, call, errors):
+    kept_open = 0
+    for error in errors:
+        injected = 0
+        for when in patterns(call, error, long_form):
+            with Strace(rig.daemon, call.names, f"error={error}:when={when}") as strace:
+                rig.busy_cycle()
+            injected += strace.injected
+            if call.name == "close":
+                # The tracer keeps the call from being made, so these stay open.
+                kept_open += strace.injected
+            rig.check(kept_open)
+        assert injected > 0
+        count(f"cycle  {call.name} {error}", injected)
+    assert rig.daemon.stop() == 0

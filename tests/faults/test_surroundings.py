@@ -1,0 +1,170 @@
+"""A full /tmp, an /etc that takes nothing, a /sys/block that cannot be opened."""
+
+import pytest
+from preload import HASTE, install
+from rig import database_fault
+from starting import Starts
+from strace import Strace
+
+from world.state import DISK_DB, DISK_JSON, PID_FILE
+
+pytestmark = pytest.mark.needs_fs("ext4")
+
+CONFIG_DIR = "/etc/config/tarn_nas"
+HOOK = "/etc/hotplug.d/block/10-mount"
+FILLER = "filler"
+# Once nothing has changed for 30 s the files are written in each cycle.
+NEXT_PUBLICATION = (30 + 3 + 8) / HASTE
+
+
+def fill(world, folder):
+    """Leave no room in a folder's filesystem."""
+    world.sh(f"cat /dev/zero > {folder}/{FILLER}", check=False)
+
+
+def remount(world, options, target):
+    world.run("mount", "-o", f"remount,{options}", target)
+
+
+def own_config_dir(world, size_kib):
+    """A filesystem of its own, and small, under the database; what is there is kept."""
+    world.sh(f"mkdir -p {CONFIG_DIR} /run/world/kept && cp -a {CONFIG_DIR}/. /run/world/kept &&"
+             f"mount -t tmpfs -o size={size_kib}k,mode=755 tmpfs {CONFIG_DIR} &&"
+             f"cp -a /run/world/kept/. {CONFIG_DIR}")
+
+
+@pytest.fixture
+def starts(world, start_daemon, libraries):
+    return Starts(world, install(world, libraries, "haste"))
+
+
+def start_without(starts):
+    """A hastened start in a world where something is wrong."""
+    return starts.world.start_daemon(environ=starts.environ)
+
+
+def test_full_tmp_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
+    fill(rig.world, "/tmp")
+    rig.busy_cycle()
+    rig.world.path(f"/tmp/{FILLER}").unlink()
+    rig.check()
+
+
+def test_tmp_without_a_free_inode_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
+    world = rig.world
+    used = int(world.run("df", "--output=iused", "/tmp").stdout.split()[-1])
+    remount(world, f"nr_inodes={used}", "/tmp")
+    mark = rig.daemon.mark()
+    rig.busy_cycle()
+    assert "ERROR[mount_table.cpp" in rig.daemon.log_since(mark)
+    remount(world, "nr_inodes=10000", "/tmp")
+    rig.check()
+
+
+def test_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
+    world = starts.world
+    fill(world, "/tmp")
+    daemon = start_without(starts)
+    world.wait(lambda: "=== ===> dev err, dev = /dev/sda" in daemon.log(), 10, "the look at sda")
+    # Full is full: the pid file is there and empty.
+    assert world.read(PID_FILE) == ""
+    assert world.mounted() == {}
+    world.path(f"/tmp/{FILLER}").unlink()
+    starts.bring_back(daemon)
+    assert daemon.stop() == 0
+
+
+def test_status_cut_short_by_a_full_tmp_is_whole_again_with_a_later_cycle(rig):
+    world = rig.world
+    world.path(DISK_JSON).write_text("")
+    fill(world, "/tmp")
+    world.wait(lambda: "exec cmd = mount" in rig.daemon.log(), 5, "a cycle")
+    assert world.read(DISK_JSON) == ""
+    world.path(f"/tmp/{FILLER}").unlink()
+    rig.wait_right(NEXT_PUBLICATION)
+
+
+def test_etc_that_turns_read_only_keeps_every_row_and_takes_new_ones_afterwards(rig):
+    world = rig.world
+    before = world.db_rows()
+    remount(world, "ro", "/etc")
+    mark = rig.daemon.mark()
+    rig.busy_cycle()
+    assert "attempt to write a readonly database" in rig.daemon.log_since(mark)
+    assert world.db_rows() == before
+    remount(world, "rw", "/etc")
+    rig.check()
+
+
+def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwards(starts):
+    world = starts.world
+    assert world.exists(HOOK)
+    remount(world, "ro", "/etc")
+    daemon = start_without(starts)
+    world.wait(starts.is_right, 10, "the disk in disk.json")
+    assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
+    assert world.exists(HOOK)
+
+    remount(world, "rw", "/etc")
+    world.send("#remove_dev:sda")
+    world.announce(starts.disk)
+    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 10, "a row")
+    world.wait(starts.is_right, 10, "the disk in disk.json")
+    assert daemon.stop() == 0
+    # The hook of the system's own is the next start's to delete.
+    start_without(starts)
+    assert not world.exists(HOOK)
+
+
+def test_full_filesystem_under_the_database_keeps_every_row_and_takes_changes_afterwards(rig):
+    world = rig.world
+    own_config_dir(world, 64)
+    before = world.db_rows()
+    fill(world, CONFIG_DIR)
+    mark = rig.daemon.mark()
+    rig.busy_cycle()
+    assert "sqlite err = database or disk is full" in rig.daemon.log_since(mark)
+    assert world.db_rows() == before
+    assert not database_fault(world)
+    world.path(f"{CONFIG_DIR}/{FILLER}").unlink()
+    rig.check()
+
+
+def test_full_filesystem_without_a_database_stops_no_mount_and_a_row_follows(starts):
+    world = starts.world
+    own_config_dir(world, 64)
+    fill(world, CONFIG_DIR)
+    daemon = start_without(starts)
+    world.wait(starts.is_right, 10, "the disk in disk.json")
+    assert "sqlite err = " in daemon.log()
+    assert not world.path(DISK_DB).exists() or world.path(DISK_DB).stat().st_size == 0
+    world.path(f"{CONFIG_DIR}/{FILLER}").unlink()
+    starts.bring_back(daemon)
+    world.send("#remove_dev:sda")
+    world.announce(starts.disk)
+    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 10, "a row")
+
+
+def test_sys_block_that_cannot_be_opened_for_a_cycle_takes_no_disk_away(rig):
+    mark = rig.daemon.mark()
+    with Strace(rig.daemon, ["openat", "open"], "error=EACCES", path="/sys/block") as strace:
+        rig.busy_cycle()
+        # Not even the safe removal sees a disk.
+        assert rig.world.mounted()["/dev/sda1"] == rig.paths()["/dev/sda1"]
+    assert strace.injected > 0
+    assert "open dir err, dir = /sys/block" in rig.daemon.log_since(mark)
+    rig.check()
+
+
+def test_sys_block_that_cannot_be_opened_at_start_leaves_the_disks_to_their_announcement(starts):
+    world = starts.world
+    daemon = world.start_daemon(environ=starts.environ, held=True)
+    with Strace(daemon, ["openat", "open"], "error=EIO", path="/sys/block"):
+        daemon.release()
+        daemon.wait_log("open dir err, dir = /sys/block")
+        daemon.wait_idle_cycles(2)
+    assert world.mounted() == {}
+    # Nothing is looked for before the first disk is known.
+    world.announce(starts.disk)
+    world.wait(starts.is_right, 10, "the announced disk")
+    assert daemon.stop() == 0
