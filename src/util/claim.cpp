@@ -51,9 +51,10 @@ void text_copy_without_slash(char (&out)[PATH_SIZE], const char* path)
     }
 }
 
-int remove_entry(const char* path)
+// 1 when a directory stays. Any other entry that cannot be removed shows when the file is created.
+int free_name(const char* path)
 {
-    if (unlink(path) == 0 || errno == ENOENT) {
+    if (unlink(path) == 0 || (errno != EISDIR && errno != EPERM)) {
         return 0;
     }
     return rmdir(path) == 0 ? 0 : move_aside(path);
@@ -67,7 +68,7 @@ int claim_file(const char* path)
         return 1;
     }
     for (int i = 0; i < CLAIM_TRIES; ++i) {
-        if (remove_entry(path) != 0) {
+        if (free_name(path) != 0) {
             return 1;
         }
         const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, PRIVATE_MODE);
