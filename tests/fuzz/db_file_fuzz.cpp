@@ -21,17 +21,21 @@ namespace {
 constexpr char JOURNAL_FILE[] = "/etc/config/tarn_nas/disk.db-journal";
 constexpr char STORED_UID[] = "1234-ABCD";
 constexpr size_t COUNTERS = 4096;
+constexpr size_t COMPLAINT_LENGTH = 16;
 
 // libFuzzer looks here for coverage of the program's own.
 __attribute__((section("__libfuzzer_extra_counters"))) uint8_t complaints[COUNTERS];
 
-// The message names the line of SQLite that found the fault.
+// Where SQLite found the file damaged, it names its own line; other messages are told apart by how
+// they begin, since they quote the file.
 void note_complaint(void* context, int code, const char* message)
 {
     static_cast<void>(context);
+    const char* line = strstr(message, "at line ");
+    const char* text = line != nullptr ? line : message;
     auto hash = static_cast<uint32_t>(code);
-    for (const char* c = message; *c != '\0'; ++c) {
-        hash = hash * 31 + static_cast<uint8_t>(*c);
+    for (size_t i = 0; i < COMPLAINT_LENGTH && text[i] != '\0'; ++i) {
+        hash = hash * 31 + static_cast<uint8_t>(text[i]);
     }
     complaints[hash % COUNTERS] = 1;
 }
