@@ -173,6 +173,19 @@ std::vector<const disk_obj*> published_disks()
     return disks;
 }
 
+std::vector<const part_info*> unlabelled_parts(const std::vector<const disk_obj*>& disks)
+{
+    std::vector<const part_info*> parts;
+    for (const disk_obj* disk : disks) {
+        for (const part_info* part : published_parts(*disk)) {
+            if (part->label[0] == '\0') {
+                parts.push_back(part);
+            }
+        }
+    }
+    return parts;
+}
+
 // Sizes that a device can have stand as whole numbers, larger ones as near as a double is.
 void require_number(const std::string& number, const std::string& promised)
 {
@@ -235,8 +248,12 @@ void fuzz_one(const std::string& input)
     }
     const std::vector<const disk_obj*> disks = published_disks();
     expected.add_all(disks);
+    const std::vector<const part_info*> unlabelled = unlabelled_parts(disks);
     disk_sets_publish(&sets);
     check_files(disks.size());
+    for (const part_info* part : unlabelled) {
+        require(std::string(part->label) == part->dev_name, "the record keeps the label it got");
+    }
     require(static_cast<size_t>(disk_sets_count(&sets)) == disks.size(),
             "disks with nothing to publish are forgotten");
 }
