@@ -330,8 +330,8 @@ TEST_F(DiskDb, a_database_cut_short_is_an_error_and_no_crash)
 TEST_F(DiskDb, a_read_only_database_is_read_and_its_failed_updates_are_only_logged)
 {
     add_row("U-1", "sda1", "disk1_part1");
-    ASSERT_EQ(mount(CONFIG_DIR, CONFIG_DIR, nullptr, MS_BIND, nullptr), 0);
-    ASSERT_EQ(mount(nullptr, CONFIG_DIR, nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr), 0);
+    ASSERT_EQ(mount(CONFIG_DIR, CONFIG_DIR, "none", MS_BIND, nullptr), 0);
+    ASSERT_EQ(mount(nullptr, CONFIG_DIR, "none", MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr), 0);
 
     disk_db_record record{};
     EXPECT_EQ(disk_db_get("U-1", &record), 0);
