@@ -39,7 +39,8 @@ struct control {
     int32_t every; /* kind OWN has no operations: every so many-th allocation fails */
     int32_t own_seen;
     int32_t own_failed;
-    int32_t count; /* operations finished */
+    int32_t own_left; /* blocks of the program itself that are not given back */
+    int32_t count;    /* operations finished */
     struct operation done[MAX_OPERATIONS];
 };
 
@@ -144,20 +145,37 @@ static int must_fail(int kind)
     return fails;
 }
 
+static void note_left(void)
+{
+    if (watched(OWN)) {
+        control->own_left = live_count;
+    }
+}
+
 static void forget(void* block)
 {
     for (int i = 0; i < live_count; ++i) {
         if (live[i] == block) {
             live[i] = live[--live_count];
+            note_left();
             return;
         }
     }
 }
 
-static void* remember(int kind, void* block)
+/* What the C library keeps for the program, as the buffer of an open file, is its own affair. */
+static int is_counted(int kind, uintptr_t caller)
 {
-    if (block != NULL && kind != OWN && watched(kind) && live_count < MAX_LIVE) {
+    struct range program = ranges[OWN][0];
+    return watched(kind) && (kind != OWN || (caller >= program.begin && caller < program.end));
+}
+
+static void* remember(void* caller, void* block)
+{
+    if (block != NULL && live_count < MAX_LIVE &&
+        is_counted(kind_of((uintptr_t)caller), (uintptr_t)caller)) {
         live[live_count++] = block;
+        note_left();
     }
     return block;
 }
@@ -170,24 +188,25 @@ static void* refuse(void)
 
 void* malloc(size_t size)
 {
-    int kind = kind_of((uintptr_t)__builtin_return_address(0));
-    return must_fail(kind) ? refuse() : remember(kind, __libc_malloc(size));
+    void* caller = __builtin_return_address(0);
+    return must_fail(kind_of((uintptr_t)caller)) ? refuse() : remember(caller, __libc_malloc(size));
 }
 
 void* calloc(size_t count, size_t size)
 {
-    int kind = kind_of((uintptr_t)__builtin_return_address(0));
-    return must_fail(kind) ? refuse() : remember(kind, __libc_calloc(count, size));
+    void* caller = __builtin_return_address(0);
+    return must_fail(kind_of((uintptr_t)caller)) ? refuse()
+                                                 : remember(caller, __libc_calloc(count, size));
 }
 
 void* realloc(void* old, size_t size)
 {
-    int kind = kind_of((uintptr_t)__builtin_return_address(0));
-    if (must_fail(kind)) {
+    void* caller = __builtin_return_address(0);
+    if (must_fail(kind_of((uintptr_t)caller))) {
         return refuse();
     }
     forget(old);
-    return remember(kind, __libc_realloc(old, size));
+    return remember(caller, __libc_realloc(old, size));
 }
 
 void free(void* block)

@@ -11,7 +11,7 @@ SQLITE, CJSON, OWN = 1, 2, 3
 
 # As alloc.c has it.
 _FIELDS = ("armed", "from_on", "next", "step", "repeat", "every", "own_seen",
-           "own_failed", "count")
+           "own_failed", "own_left", "count")
 _WORD = struct.Struct("=i")
 _OPERATION = struct.Struct("=iiii")
 _MAX_OPERATIONS = 20000
@@ -48,7 +48,7 @@ class Allocations:
         self.disarm()
         for name, value in (("from_on", from_on), ("next", first), ("step", step),
                             ("repeat", repeat), ("every", every), ("own_seen", 0),
-                            ("own_failed", 0), ("count", 0), ("armed", kind)):
+                            ("own_failed", 0), ("own_left", 0), ("count", 0), ("armed", kind)):
             self._set(name, int(value))
 
     def disarm(self):
@@ -57,6 +57,11 @@ class Allocations:
     @property
     def own_failed(self):
         return self._get("own_failed")
+
+    @property
+    def own_left(self):
+        """Blocks of the program's own, made since `arm`, that it has not given back."""
+        return self._get("own_left")
 
     def operations(self):
         """What was done since `arm`."""

@@ -16,8 +16,10 @@ class Call:
     errors   what a kernel can really return for it
     hides    its failure can hide a device's data, so the device is left out, or
              recorded with gaps, until it is announced again
-    stages   it is made at start-up, in a running cycle, or in both
+    stages   it is made at start-up ("start"), in a running cycle ("cycle"), for the copy
+             of the log ("syslog"), or to get what strangers planted out of the way ("planted")
     rare     once or twice in a cycle
+    vital    without it the daemon ends, in order
     """
 
     names: tuple
@@ -25,6 +27,7 @@ class Call:
     hides: bool = False
     stages: tuple = ("start", "cycle")
     rare: bool = False
+    vital: bool = False
 
     @property
     def name(self):
@@ -47,7 +50,8 @@ CALLS = (
     Call(("statfs",), ("EIO", "EACCES", "ENOMEM", "EINTR")),
     # A scratch file that cannot be claimed is not written to.
     Call(("unlink", "unlinkat"), ("EIO", "EACCES", "ENOSPC", "ENOMEM"), hides=True),
-    Call(("mknodat", "mknod"), ("ENOSPC", "EACCES", "EIO", "ENOMEM"), stages=("start",)),
+    Call(("mknodat", "mknod"), ("ENOSPC", "EACCES", "EIO", "ENOMEM"), stages=("start",),
+         vital=True),
     Call(("pread64",), ("EIO", "EINTR")),
     Call(("pwrite64",), ("ENOSPC", "EIO", "EINTR")),
     Call(("fdatasync", "fsync"), ("EIO", "ENOSPC", "EINTR")),
@@ -63,6 +67,12 @@ CALLS = (
     Call(("wait4", "waitid"), ("EINTR",)),
     Call(("pselect6", "select"), ("EINTR", "ENOMEM")),
     Call(("clock_nanosleep", "nanosleep"), ("EINTR",)),
+    Call(("socket",), ("EMFILE", "ENOMEM", "EACCES"), stages=("syslog",)),
+    Call(("connect",), ("ECONNREFUSED", "EACCES", "EINTR"), stages=("syslog",)),
+    Call(("sendto",), ("ENOMEM", "EAGAIN", "EINTR"), stages=("syslog",)),
+    Call(("mkdir", "mkdirat"), ("ENOSPC", "EIO", "ENOMEM"), stages=("planted",)),
+    Call(("rename", "renameat", "renameat2"), ("ENOSPC", "EIO", "EACCES"), stages=("planted",)),
+    Call(("rmdir",), ("EIO", "EACCES", "ENOMEM"), stages=("planted",)),
 )
 
 # Calls without an error that a correct program can meet; brk has none at all, it
@@ -84,3 +94,19 @@ def known_names():
 
 def of_stage(stage):
     return [call for call in CALLS if stage in call.stages]
+
+
+def in_portions(stage, size):
+    """(call, errors) pairs, at most so many errors each."""
+    return [(call, call.errors[first:first + size]) for call in of_stage(stage)
+            for first in range(0, len(call.errors), size)]
+
+
+def parametrize(metafunc, stages, size):
+    """Give a test its stages, calls and errors; the long form one error at a time, to share
+    the work."""
+    if "errors" in metafunc.fixturenames:
+        size = 1 if metafunc.config.getoption("--long") else size
+        cases = [(stage, *pair) for stage in stages for pair in in_portions(stage, size)]
+        metafunc.parametrize("stage, call, errors", cases, ids=[
+            f"{stage}-{call.name}-{'-'.join(errors)}" for stage, call, errors in cases])

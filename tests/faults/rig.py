@@ -38,7 +38,7 @@ class Rig:
     # What a cycle is made of.
 
     def busy_cycle(self):
-        """All that a cycle can hold: removal, addition, mount, publication, rescan, safe removal."""
+        """All that a cycle holds: removal, addition, mount, publication, rescan, safe removal."""
         moved = self.disks[1]
         begun = time.monotonic()
         self.world.send(f"#remove_dev:{moved.name}1", *add_messages(moved))

@@ -36,7 +36,7 @@ class Starts:
 
     def baseline(self):
         """Names of the daemon's own calls of an undisturbed start, in order."""
-        daemon = self._held()
+        daemon = self.held()
         with Strace(daemon) as strace:
             daemon.release()
             self.world.wait(self.is_right, 20, "a start without a fault")
@@ -59,33 +59,33 @@ class Starts:
         daemon has ended as it does without its pipes and the next start is right.
         """
         nth = self._first_own[name] + number
-        daemon = self._held()
+        daemon = self.held()
         with Strace(daemon, [name], f"error={error}:when={nth}") as strace:
             daemon.release()
-            ended = self._settle(daemon, call)
+            ended = self.settle(daemon, call.hides)
+        assert ended or not call.vital
         if ended:
-            self._check_orderly_end(daemon)
-            daemon = self.world.start_daemon(environ=self.environ)
-            self._wait_right(daemon, _HELPED)
+            daemon = self.start_after(daemon)
         fault = database_fault(self.world)
         assert not fault, fault
         self._end(daemon)
         return strace.injected
 
-    def _held(self):
+    def held(self):
+        """A daemon that waits to be let go, in a world as an earlier run left it."""
         self.world.sh("umount /tmp/mountd/* 2>/dev/null; rm -rf /tmp/tarn_nas", check=False)
         self.world.path(DISK_DB).unlink(missing_ok=True)
         self.world.write(PID_FILE, "999999")
         return self.world.start_daemon(held=True, environ=self.environ)
 
-    def _settle(self, daemon, call):
-        """True when the daemon ended; otherwise all is right."""
+    def settle(self, daemon, hides):
+        """True when the daemon ended; otherwise all is right, by itself if nothing hides data."""
         try:
             self.world.wait(lambda: self.is_right() or not daemon.running, _BY_ITSELF, "")
             self.outcomes["right by itself"] += daemon.running
             return not daemon.running
         except WaitTimeout:
-            assert call.hides, f"not right by itself; {self.world.diagnosis()}"
+            assert hides, f"not right by itself; {self.world.diagnosis()}"
         self.outcomes[self.bring_back(daemon)] += 1
         return False
 
@@ -106,11 +106,15 @@ class Starts:
         self._wait_right(daemon, _HELPED)
         return "right once plugged again"
 
-    def _check_orderly_end(self, daemon):
+    def start_after(self, daemon):
+        """After an end in order the next start, without a fault, is right; returns its daemon."""
         assert daemon.returncode == 0
         assert any(text in daemon.log() for text in _NO_PIPES)
         assert not self.world.exists(PID_FILE)
         self.outcomes["ended in order, the next start right"] += 1
+        daemon = self.world.start_daemon(environ=self.environ)
+        self._wait_right(daemon, _HELPED)
+        return daemon
 
     def _wait_right(self, daemon, timeout):
         self.world.wait(lambda: self.is_right() or not daemon.running, timeout,

@@ -4,6 +4,8 @@ import pytest
 from allocations import CJSON, OWN, SQLITE, Allocations
 from preload import install
 from rig import Rig, database_fault
+from starting import Starts
+from strace import Strace
 
 from world import Partition
 from world.state import DISK_DB
@@ -15,6 +17,7 @@ HASTE = 30
 SWAPS = 8
 SWEEP_END = 240
 CLEAN = 6
+NEVER = 1_000_000
 
 
 @pytest.fixture
@@ -88,6 +91,21 @@ def test_database_survives_each_allocation_that_fails_in_it(prepared, count, fro
     assert daemon.stop() == 0
 
 
+def test_database_that_cannot_be_opened_keeps_no_memory(prepared):
+    world, allocations, environ = prepared
+    world.path(DISK_DB).mkdir(parents=True)
+    world.plug(swap_disks(world)[0], "sda")
+    world.start_companion()
+    daemon = world.start_daemon(environ=environ)
+    # Counted, and none fails.
+    allocations.arm(SQLITE, first=NEVER, step=0)
+    world.wait(lambda: len(allocations.operations()) > 2 * SWAPS, 20, "a pass over the partitions")
+    allocations.disarm()
+    assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
+    assert [operation for operation in allocations.operations() if operation.left] == []
+    assert daemon.stop() == 0
+
+
 @pytest.mark.needs_fs("ext4")
 def test_memory_that_stays_short_is_survived_in_every_library(
         world, start_daemon, libraries, count):
@@ -121,3 +139,45 @@ def test_own_allocations_that_fail_in_a_cycle_are_survived(
             count("own    every so many-th of a cycle", allocations.own_failed)
             rig.check()
     assert rig.daemon.stop() == 0
+
+
+@pytest.mark.needs_fs("ext4")
+def test_memory_for_what_cannot_be_read_is_given_back(world, start_daemon, libraries, count):
+    environ = install(world, libraries, "haste", "alloc")
+    allocations = Allocations(world)
+    rig = Rig(world, environ=environ)
+    for name, error in (("read", "EIO"), ("openat", "EMFILE"), ("newfstatat", "ENOMEM")):
+        # Counted, and none fails.
+        allocations.arm(OWN, first=NEVER)
+        with Strace(rig.daemon, [name], f"error={error}:when=1+2") as strace:
+            rig.busy_cycle()
+        rig.answer()
+        assert allocations.own_left == 0
+        allocations.disarm()
+        count(f"cycle   {name} {error}", strace.injected)
+        rig.check()
+    assert rig.daemon.stop() == 0
+
+
+@pytest.mark.needs_fs("ext4")
+@pytest.mark.parametrize("kind", [SQLITE, CJSON, OWN], ids=["sqlite", "cjson", "own"])
+def test_start_without_memory_ends_in_order_or_is_right_once_there_is_some(
+        world, start_daemon, libraries, count, outcome, kind):
+    starts = Starts(world, install(world, libraries, "haste", "alloc"))
+    allocations = Allocations(world)
+    patterns = [(first, every) for every in (1, 2, 3) for first in range(1, every + 1)]
+    for first, every in patterns if kind == OWN else [(1, 1)]:
+        daemon = starts.held()
+        allocations.arm(kind, first=first, every=every, step=0, from_on=kind != OWN)
+        daemon.release()
+        world.wait(lambda: "no event ..." in daemon.log() or not daemon.running, 20, "a cycle")
+        allocations.disarm()
+        failed = allocations.own_failed + sum(done.failed for done in allocations.operations())
+        assert failed > 0
+        count("start   memory", failed)
+        if not daemon.running or starts.settle(daemon, True):
+            daemon = starts.start_after(daemon)
+        assert not database_fault(world)
+        assert daemon.stop() == 0
+    for what, times in starts.outcomes.items():
+        outcome(what, times)

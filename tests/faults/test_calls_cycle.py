@@ -1,8 +1,10 @@
 """Every system call of a running daemon fails: in removal, addition, mount, idle work, rescan
 and safe removal."""
 
+import signal
+
 import pytest
-from calls import known_names, names_in, of_stage
+from calls import known_names, names_in, of_stage, parametrize
 from strace import Strace
 
 pytestmark = pytest.mark.needs_fs("ext4")
@@ -12,14 +14,11 @@ pytestmark = pytest.mark.needs_fs("ext4")
 SHORT = ("1+2", "1+1", "2+3", "1+3")
 LONG = tuple(f"{first}+{step}" for step in (1, 2, 3, 5, 7) for first in range(1, step + 1))
 _PER_TEST = 3
+SCRATCH = "mount.txt tmp_blkid out.txt disk_uid.txt"
 
 
-def cases():
-    """(call, its next few errors): the faults that one daemon lives through."""
-    for call in of_stage("cycle"):
-        for first in range(0, len(call.errors), _PER_TEST):
-            yield pytest.param(call, call.errors[first:first + _PER_TEST],
-                               id=f"{call.name}-{'-'.join(call.errors[first:first + _PER_TEST])}")
+def pytest_generate_tests(metafunc):
+    parametrize(metafunc, ("cycle", "syslog", "planted"), _PER_TEST)
 
 
 def patterns(call, error, long_form):
@@ -42,13 +41,22 @@ def test_every_call_of_a_cycle_is_known(rig):
     assert missed == []
 
 
-@pytest.mark.parametrize("call, errors", cases())
+def prepare(rig, stage):
+    """What makes the daemon do the calls of a stage."""
+    if stage == "syslog" and not rig.world.exists("/dev/log"):
+        rig.world.syslog()
+        rig.daemon.signal(signal.SIGUSR2)
+    elif stage == "planted":
+        rig.world.sh(f"for name in {SCRATCH}; do mkdir -p /tmp/$name/full; done")
+
+
 def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
-        rig, count, long_form, call, errors):
+        rig, count, long_form, stage, call, errors):
     kept_open = 0
     for error in errors:
         injected = 0
         for when in patterns(call, error, long_form):
+            prepare(rig, stage)
             with Strace(rig.daemon, call.names, f"error={error}:when={when}") as strace:
                 rig.busy_cycle()
             injected += strace.injected
@@ -57,5 +65,5 @@ def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
                 kept_open += strace.injected
             rig.check(kept_open)
         assert injected > 0
-        count(f"cycle  {call.name} {error}", injected)
+        count(f"{stage:8}{call.name} {error}", injected)
     assert rig.daemon.stop() == 0

@@ -2,7 +2,7 @@
 
 import preload
 import pytest
-from calls import known_names, of_stage
+from calls import known_names, of_stage, parametrize
 from starting import Starts
 
 pytestmark = pytest.mark.needs_fs("ext4")
@@ -16,12 +16,8 @@ def starts(world, start_daemon, libraries):
     return Starts(world, preload.install(world, libraries, "haste"))
 
 
-def cases():
-    """(call, its next few errors): the faults that one world's starts meet."""
-    for call in of_stage("start"):
-        for first in range(0, len(call.errors), _PER_TEST):
-            yield pytest.param(call, call.errors[first:first + _PER_TEST],
-                               id=f"{call.name}-{'-'.join(call.errors[first:first + _PER_TEST])}")
+def pytest_generate_tests(metafunc):
+    parametrize(metafunc, ("start",), _PER_TEST)
 
 
 def chosen(call, error, how_many, long_form):
@@ -39,9 +35,8 @@ def test_every_call_of_a_start_is_known(starts):
     assert missed == []
 
 
-@pytest.mark.parametrize("call, errors", cases())
 def test_failing_call_at_start_ends_in_order_or_leads_to_a_right_state(
-        starts, count, outcome, long_form, call, errors):
+        starts, count, outcome, long_form, stage, call, errors):
     own = starts.baseline()
     for error in errors:
         injected = 0
@@ -49,6 +44,6 @@ def test_failing_call_at_start_ends_in_order_or_leads_to_a_right_state(
             for number in chosen(call, error, how_many, long_form):
                 injected += starts.fail(call, name, error, number)
         assert injected > 0
-        count(f"start  {call.name} {error}", injected)
+        count(f"{stage:8}{call.name} {error}", injected)
     for what, times in starts.outcomes.items():
         outcome(what, times)

@@ -1,11 +1,14 @@
 """A full /tmp, an /etc that takes nothing, a /sys/block that cannot be opened."""
 
+import os
+
 import pytest
 from preload import HASTE, install
 from rig import database_fault
 from starting import Starts
 from strace import Strace
 
+from world import Partition
 from world.state import DISK_DB, DISK_JSON, PID_FILE
 
 pytestmark = pytest.mark.needs_fs("ext4")
@@ -13,6 +16,7 @@ pytestmark = pytest.mark.needs_fs("ext4")
 CONFIG_DIR = "/etc/config/tarn_nas"
 HOOK = "/etc/hotplug.d/block/10-mount"
 FILLER = "filler"
+PAGE = 4096
 # Once nothing has changed for 30 s the files are written in each cycle.
 NEXT_PUBLICATION = (30 + 3 + 8) / HASTE
 
@@ -74,7 +78,7 @@ def test_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
     assert daemon.stop() == 0
 
 
-def test_status_cut_short_by_a_full_tmp_is_whole_again_with_a_later_cycle(rig):
+def test_status_emptied_by_a_full_tmp_is_whole_again_with_a_later_cycle(rig):
     world = rig.world
     world.path(DISK_JSON).write_text("")
     fill(world, "/tmp")
@@ -82,6 +86,28 @@ def test_status_cut_short_by_a_full_tmp_is_whole_again_with_a_later_cycle(rig):
     assert world.read(DISK_JSON) == ""
     world.path(f"/tmp/{FILLER}").unlink()
     rig.wait_right(NEXT_PUBLICATION)
+
+
+def test_status_cut_in_the_middle_by_a_full_tmp_is_whole_again_with_a_later_cycle(
+        world, start_daemon, libraries):
+    for name in ("sda", "sdb", "sdc"):
+        parts = [Partition("swap", 1001) for _ in range(8)]
+        world.plug(world.partitioned_disk(*parts), name)
+    world.start_companion()
+    daemon = world.start_daemon(environ=install(world, libraries, "haste"))
+    world.wait(lambda: len(world.parts()) == 24, 20, "24 partitions in disk.json")
+    whole = world.read(DISK_JSON)
+    assert len(whole) > PAGE
+
+    # Room for one page: the first is written, the second is not.
+    fill(world, "/tmp")
+    world.sh(f"rm {DISK_JSON}; cat /dev/zero >> /tmp/{FILLER}", check=False)
+    os.truncate(world.path(f"/tmp/{FILLER}"), world.path(f"/tmp/{FILLER}").stat().st_size - PAGE)
+    world.wait(lambda: world.exists(DISK_JSON) and world.read(DISK_JSON) == whole[:PAGE], 20,
+               "a first page")
+    world.path(f"/tmp/{FILLER}").unlink()
+    world.wait(lambda: world.read(DISK_JSON) == whole, NEXT_PUBLICATION, "the whole document")
+    assert daemon.stop() == 0
 
 
 def test_etc_that_turns_read_only_keeps_every_row_and_takes_new_ones_afterwards(rig):
@@ -149,8 +175,10 @@ def test_sys_block_that_cannot_be_opened_for_a_cycle_takes_no_disk_away(rig):
     mark = rig.daemon.mark()
     with Strace(rig.daemon, ["openat", "open"], "error=EACCES", path="/sys/block") as strace:
         rig.busy_cycle()
-        # Not even the safe removal sees a disk.
-        assert rig.world.mounted()["/dev/sda1"] == rig.paths()["/dev/sda1"]
+        # Not even the safe removal sees the disk that stayed; the files do not say that it went.
+        rig.answer()
+        assert rig.world.mounted() == {"/dev/sda1": rig.paths()["/dev/sda1"]}
+        assert set(rig.world.parts()) == {"sda1"}
     assert strace.injected > 0
     assert "open dir err, dir = /sys/block" in rig.daemon.log_since(mark)
     rig.check()

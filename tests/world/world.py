@@ -26,7 +26,8 @@ PROGRAM = CHECKOUT / "build/release/tarn_nas_diskmanager"
 HOTPLUG_HOOK = "/etc/hotplug.d/block/10-mount"
 _NAMESPACES = ["--mount", "--pid", "--ipc", "--uts"]
 # A shell that turns into the program once it is let go, with the same process id.
-_HOLD = 'read -r go; exec "$0" "$@" < /dev/null'
+_HELD = "held back"
+_HOLD = f'echo {_HELD}; read -r go; exec "$0" "$@" < /dev/null'
 _BOOT = "import json,sys; job=json.loads(sys.stdin.readline()); exec(job['code'])"
 # What a router's kernel lists beside the disks; the daemon must pass over them.
 _OTHER_DEVICES = ("loop0", "mtdblock0", "zram0")
@@ -157,7 +158,9 @@ class World(state.Observed):
         self._processes.append(process)
         daemon = Daemon(process, log_path)
         self._daemons.append(daemon)
-        if wait and not held:
+        if held:
+            daemon.wait_log(_HELD)
+        elif wait:
             daemon.wait_started()
         return daemon
 
