@@ -147,7 +147,12 @@ class Daemon:
     def fds(self):
         """What its open descriptors point to."""
         folder = f"/proc/{self.outer_pid}/fd"
-        return {int(name): os.readlink(f"{folder}/{name}") for name in os.listdir(folder)}
+        found = {}
+        for name in os.listdir(folder):
+            # One that it closes meanwhile is not open.
+            with contextlib.suppress(FileNotFoundError):
+                found[int(name)] = os.readlink(f"{folder}/{name}")
+        return found
 
     def _find_process(self):
         """True once its pid is known, or it ended before it could be seen."""
