@@ -17,7 +17,8 @@ class Call:
     hides    its failure can hide a device's data, so the device is left out, or
              recorded with gaps, until it is announced again
     stages   it is made at start-up ("start"), in a running cycle ("cycle"), for the copy
-             of the log ("syslog"), or to get what strangers planted out of the way ("planted")
+             of the log ("syslog"), or to get what strangers planted out of the way
+             ("planted"); "files" is a cycle in which only scratch files are meant
     rare     once or twice in a cycle
     vital    without it the daemon ends, in order
     """
@@ -33,6 +34,9 @@ class Call:
     def name(self):
         return self.names[0]
 
+
+# What commands answered stands in these.
+SCRATCH = ("/tmp/mount.txt", "/tmp/tmp_blkid", "/tmp/out.txt", "/tmp/disk_uid.txt")
 
 CALLS = (
     Call(("openat", "open"), ("EMFILE", "ENOMEM", "EACCES", "EIO", "ENOSPC", "EINTR"), hides=True),
@@ -67,6 +71,8 @@ CALLS = (
     Call(("wait4", "waitid"), ("EINTR",)),
     Call(("pselect6", "select"), ("EINTR", "ENOMEM")),
     Call(("clock_nanosleep", "nanosleep"), ("EINTR",)),
+    # A pipe whose first byte cannot be read gives no message, and so no further calls.
+    Call(("read",), ("EIO", "EAGAIN", "EINTR"), stages=("files",)),
     Call(("socket",), ("EMFILE", "ENOMEM", "EACCES"), stages=("syslog",)),
     Call(("connect",), ("ECONNREFUSED", "EACCES", "EINTR"), stages=("syslog",)),
     Call(("sendto",), ("ENOMEM", "EAGAIN", "EINTR"), stages=("syslog",)),

@@ -19,10 +19,10 @@ class Strace:
 
     names  the calls to trace, of which this processor may lack some; all when empty
     fault  what they end with instead of being made; nothing fails when empty
-    path   only calls on this path or on a descriptor of it
+    paths  only calls on one of these or on a descriptor of it; all when empty
     """
 
-    def __init__(self, daemon, names=(), fault="", path=""):
+    def __init__(self, daemon, names=(), fault="", paths=()):
         self._daemon = daemon
         self._output = Path(daemon.log_path).with_suffix(".strace")
         self._words = [PROGRAM, "-qq", "-p", str(daemon.outer_pid), "-o", str(self._output)]
@@ -31,7 +31,7 @@ class Strace:
             self._words += ["-e", f"trace={chosen}"]
         if fault:
             self._words += ["-e", f"inject={chosen}:{fault}"]
-        if path:
+        for path in paths:
             self._words += ["-P", path]
         self._process = None
 

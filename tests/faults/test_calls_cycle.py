@@ -4,7 +4,7 @@ and safe removal."""
 import signal
 
 import pytest
-from calls import known_names, names_in, of_stage, parametrize
+from calls import SCRATCH, known_names, names_in, of_stage, parametrize
 from strace import Strace
 
 pytestmark = pytest.mark.needs_fs("ext4")
@@ -14,11 +14,10 @@ pytestmark = pytest.mark.needs_fs("ext4")
 SHORT = ("1+2", "1+1", "2+3", "1+3")
 LONG = tuple(f"{first}+{step}" for step in (1, 2, 3, 5, 7) for first in range(1, step + 1))
 _PER_TEST = 3
-SCRATCH = "mount.txt tmp_blkid out.txt disk_uid.txt"
 
 
 def pytest_generate_tests(metafunc):
-    parametrize(metafunc, ("cycle", "syslog", "planted"), _PER_TEST)
+    parametrize(metafunc, ("cycle", "files", "syslog", "planted"), _PER_TEST)
 
 
 def patterns(call, error, long_form):
@@ -47,7 +46,7 @@ def prepare(rig, stage):
         rig.world.syslog()
         rig.daemon.signal(signal.SIGUSR2)
     elif stage == "planted":
-        rig.world.sh(f"for name in {SCRATCH}; do mkdir -p /tmp/$name/full; done")
+        rig.world.sh(f"for name in {' '.join(SCRATCH)}; do mkdir -p $name/full; done")
 
 
 def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
@@ -57,7 +56,8 @@ def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
         injected = 0
         for when in patterns(call, error, long_form):
             prepare(rig, stage)
-            with Strace(rig.daemon, call.names, f"error={error}:when={when}") as strace:
+            paths = SCRATCH if stage == "files" else ()
+            with Strace(rig.daemon, call.names, f"error={error}:when={when}", paths) as strace:
                 rig.busy_cycle()
             injected += strace.injected
             if call.name == "close":

@@ -173,7 +173,7 @@ def test_full_filesystem_without_a_database_stops_no_mount_and_a_row_follows(sta
 
 def test_sys_block_that_cannot_be_opened_for_a_cycle_takes_no_disk_away(rig):
     mark = rig.daemon.mark()
-    with Strace(rig.daemon, ["openat", "open"], "error=EACCES", path="/sys/block") as strace:
+    with Strace(rig.daemon, ["openat", "open"], "error=EACCES", paths=["/sys/block"]) as strace:
         rig.busy_cycle()
         # Not even the safe removal sees the disk that stayed; the files do not say that it went.
         rig.answer()
@@ -187,7 +187,7 @@ def test_sys_block_that_cannot_be_opened_for_a_cycle_takes_no_disk_away(rig):
 def test_sys_block_that_cannot_be_opened_at_start_leaves_the_disks_to_their_announcement(starts):
     world = starts.world
     daemon = world.start_daemon(environ=starts.environ, held=True)
-    with Strace(daemon, ["openat", "open"], "error=EIO", path="/sys/block"):
+    with Strace(daemon, ["openat", "open"], "error=EIO", paths=["/sys/block"]):
         daemon.release()
         daemon.wait_log("open dir err, dir = /sys/block")
         daemon.wait_idle_cycles(2)
