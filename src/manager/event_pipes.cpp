@@ -2,12 +2,14 @@
 
 #include <unistd.h>
 
+#include <cerrno>
 #include <cstring>
 #include <initializer_list>
 
 #include "log/log.h"
 #include "util/file.h"
 #include "util/paths.h"
+#include "util/pause.h"
 #include "util/text.h"
 
 namespace {
@@ -156,6 +158,11 @@ int event_wait(event_pipes* pipes, char* buffer, uint32_t size)
     prepare_sets(pipes);
     const int ready =
         select(pipes->max_fd + 1, &pipes->read_set, nullptr, &pipes->except_set, &pipes->timeout);
+    if (ready < 0 && errno != EINTR) {
+        // For want of memory, say: asking again at once would only make it scarcer.
+        log_errno("select err\n");
+        pause_seconds(1);
+    }
     if (ready < 1) {
         return ready;
     }
