@@ -2,9 +2,11 @@
 and safe removal."""
 
 import signal
+import time
 
 import pytest
 from calls import SCRATCH, known_names, names_in, of_stage, parametrize
+from preload import HASTE
 from strace import Strace
 
 pytestmark = pytest.mark.needs_fs("ext4")
@@ -14,6 +16,7 @@ pytestmark = pytest.mark.needs_fs("ext4")
 SHORT = ("1+2", "1+1", "2+3", "1+3")
 LONG = tuple(f"{first}+{step}" for step in (1, 2, 3, 5, 7) for first in range(1, step + 1))
 _PER_TEST = 3
+SHORTAGE = 3
 
 
 def pytest_generate_tests(metafunc):
@@ -67,3 +70,12 @@ def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
         assert injected > 0
         count(f"{stage:8}{call.name} {error}", injected)
     assert rig.daemon.stop() == 0
+
+
+def test_wait_that_keeps_failing_makes_no_busy_loop(rig, count):
+    with Strace(rig.daemon, ["pselect6", "select"], "error=ENOMEM") as strace:
+        time.sleep(SHORTAGE)
+    # A cycle a second, and one more at either end.
+    assert 0 < strace.injected <= SHORTAGE * HASTE + 2
+    count("cycle   pselect6 ENOMEM", strace.injected)
+    rig.check()
