@@ -37,12 +37,16 @@ class Rig:
 
     # What a cycle is made of.
 
-    def busy_cycle(self):
-        """All that a cycle holds: removal, addition, mount, publication, rescan, safe removal."""
+    def busy_cycle(self, enough=lambda: True):
+        """All that a cycle holds: removal, addition, mount, publication, rescan, safe removal.
+
+        On a machine with much else to do it lasts until `enough` holds.
+        """
         moved = self.disks[1]
         begun = time.monotonic()
         self.world.send(f"#remove_dev:{moved.name}1", *add_messages(moved))
-        time.sleep(max(0, begun + WINDOW - time.monotonic()))
+        while (spent := time.monotonic() - begun) < WINDOW or not enough() and spent < BOUND:
+            time.sleep(0.05)
         # Nothing was said of the other disk.
         assert self.world.mounted().get("/dev/sda1") == self.paths()["/dev/sda1"]
         self.world.safe_remove()

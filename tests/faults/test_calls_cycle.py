@@ -61,7 +61,7 @@ def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
             prepare(rig, stage)
             paths = SCRATCH if stage == "files" else ()
             with Strace(rig.daemon, call.names, f"error={error}:when={when}", paths) as strace:
-                rig.busy_cycle()
+                rig.busy_cycle(lambda: strace.injected > 0)
             injected += strace.injected
             if call.name == "close":
                 # The tracer keeps the call from being made, so these stay open.
