@@ -1,5 +1,6 @@
 """A router on which disks come and go while its daemon is killed and started again."""
 
+import os
 import random
 import threading
 import time
@@ -20,7 +21,8 @@ PIPES = [f"/tmp/tarn_nas/pipe_disk_{name}" for name in ("add_remove", "safe_remo
 # Instants to kill at: a file of the daemon's and at most how many of its events to let pass.
 FILE_INSTANTS = [("/etc/config/tarn_nas", "disk.db-journal", 12),
                  ("/etc/config/tarn_nas", "disk.db-journal", 4),
-                 ("/etc/config/tarn_nas", "disk.db", 8),
+                 ("/etc/config/tarn_nas", "disk.db-journal", 4),
+                 ("/etc/config/tarn_nas", "disk.db", 4), ("/etc/config/tarn_nas", "disk.db", 8),
                  ("/tmp/tarn_nas", "disk.json", 6), ("/tmp/tarn_nas", "disk_num.txt", 4),
                  ("/tmp/tarn_nas", "disk_manager_pid", 2), ("/tmp/tarn_nas", "pipe_disk_remove", 2),
                  ("/tmp", "mount.txt", 30), ("/tmp", "disk_uid.txt", 20), ("/tmp", "out.txt", 20),
@@ -239,7 +241,8 @@ class StormyRouter:
 
         def kill_at_event():
             with events:
-                # A transaction takes some hundred microseconds: nothing may come in between.
+                # A transaction takes some hundred microseconds: nobody may come in between.
+                os.setpriority(os.PRIO_PROCESS, threading.get_native_id(), -20)
                 events.wait(name, count, START_UP_SECONDS)
                 daemon.kill()
         return f"at event {count} of {name}", threading.Thread(target=kill_at_event)

@@ -146,7 +146,7 @@ def test_a_storm_of_signals_neither_stops_nor_garbles_anything(
         [sys.executable, SENDER, str(daemon.outer_pid),
          str(SIGNALS["long" if is_long else "short"]), str(seed)],
         stdout=subprocess.PIPE, text=True)
-    daemon.wait_log("have disk = ", 60)
+    daemon.wait_log("have disk = ", 180)
     bustle = Bustle(world, seed)
     bustle.start()
     send_sigint_until_told(daemon, 1)
