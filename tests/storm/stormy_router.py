@@ -19,10 +19,10 @@ SCRATCH = ["/tmp/out.txt", "/tmp/disk_uid.txt", "/tmp/tmp_blkid", "/tmp/mount.tx
            "/tmp/disk_pid_tmp"]
 PIPES = [f"/tmp/tarn_nas/pipe_disk_{name}" for name in ("add_remove", "safe_remove", "remove")]
 # Instants to kill at: a file of the daemon's and at most how many of its events to let pass.
-FILE_INSTANTS = [("/etc/config/tarn_nas", "disk.db-journal", 12),
-                 ("/etc/config/tarn_nas", "disk.db-journal", 4),
-                 ("/etc/config/tarn_nas", "disk.db-journal", 4),
-                 ("/etc/config/tarn_nas", "disk.db", 4), ("/etc/config/tarn_nas", "disk.db", 8),
+DATABASE_INSTANTS = [("/etc/config/tarn_nas", "disk.db-journal", 24),
+                     ("/etc/config/tarn_nas", "disk.db-journal", 4),
+                     ("/etc/config/tarn_nas", "disk.db", 8)]
+FILE_INSTANTS = [*DATABASE_INSTANTS, *DATABASE_INSTANTS,
                  ("/tmp/tarn_nas", "disk.json", 6), ("/tmp/tarn_nas", "disk_num.txt", 4),
                  ("/tmp/tarn_nas", "disk_manager_pid", 2), ("/tmp/tarn_nas", "pipe_disk_remove", 2),
                  ("/tmp", "mount.txt", 30), ("/tmp", "disk_uid.txt", 20), ("/tmp", "out.txt", 20),
@@ -60,6 +60,8 @@ class StormyRouter:
             (world.whole_disk("ext4", 1100, options=option[3]), uids[3:])]
         self.daemon = None
         self.self_checks = 0
+        # Made by the first run anyway; here so that its writes can be watched.
+        world.run("mkdir", "-p", "/etc/config/tarn_nas")
         self.plug_all()
 
     # Disks.
@@ -126,7 +128,7 @@ class StormyRouter:
     def restart(self):
         """End it in good order, move disks about, and start it without waiting."""
         self.daemon.stop()
-        if self.random.random() < 0.15:
+        if self.random.random() < 0.3:
             # May be done by hand at any time. What follows are the first rows again.
             self.world.run("rm", "-f", DISK_DB)
         self.shuffle()
@@ -233,9 +235,13 @@ class StormyRouter:
     def _prepare_kill(self):
         """A thread that kills at a moment, or at a file event, or when neither comes."""
         daemon, moment = self.daemon, self.random.uniform(0, START_UP_SECONDS)
-        folder, name, most = self.random.choice(FILE_INSTANTS)
+        # The first rows are worth more kills than their few milliseconds would get by chance.
+        first_rows = not self.world.exists(DISK_DB) and self.random.random() < 0.7
+        folder, name, most = self.random.choice(
+            DATABASE_INSTANTS if first_rows else FILE_INSTANTS)
         count = self.random.randint(1, most)
-        if self.random.random() < 0.3 or not self.world.exists(folder):
+        chance = self.random.random()
+        if chance < 0.3 and not first_rows or not self.world.exists(folder):
             return f"after {moment:.3f} s", threading.Timer(moment, daemon.kill)
         events = FileEvents(self.world.path(folder))
 

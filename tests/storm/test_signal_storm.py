@@ -155,9 +155,10 @@ def test_a_storm_of_signals_neither_stops_nor_garbles_anything(
     assert daemon.running, daemon.log()[-4000:]
 
     # All disks are there at the end, whatever was removed meanwhile.
+    mark = daemon.mark()
     world.send(*[f"#add:sd{chr(ord('a') + number)}" for number in range(DISKS)],
                "#heart_beat:last", timeout=60)
-    daemon.wait_log("get event = #heart_beat:last", 300)
+    daemon.wait_log("get event = #heart_beat:last", 300, since=mark)
     devices = {f"/dev/sd{chr(ord('a') + number)}" for number in range(DISKS)}
     world.wait(lambda: set(world.mounted()) == devices, 180, lambda: f"all, not {world.mounted()}")
     world.wait(lambda: {f"/dev/{name}": part.path for name, part in world.parts().items()}
