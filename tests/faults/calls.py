@@ -21,6 +21,7 @@ class Call:
              ("planted"); "files" is a cycle in which only scratch files are meant
     rare     once or twice in a cycle
     vital    without it the daemon ends, in order
+    stores   the database's: what was not written is written with the next mount
     """
 
     names: tuple
@@ -29,6 +30,7 @@ class Call:
     stages: tuple = ("start", "cycle")
     rare: bool = False
     vital: bool = False
+    stores: bool = False
 
     @property
     def name(self):
@@ -56,11 +58,11 @@ CALLS = (
     Call(("unlink", "unlinkat"), ("EIO", "EACCES", "ENOSPC", "ENOMEM"), hides=True),
     Call(("mknodat", "mknod"), ("ENOSPC", "EACCES", "EIO", "ENOMEM"), stages=("start",),
          vital=True),
-    Call(("pread64",), ("EIO", "EINTR")),
-    Call(("pwrite64",), ("ENOSPC", "EIO", "EINTR")),
-    Call(("fdatasync", "fsync"), ("EIO", "ENOSPC", "EINTR")),
-    Call(("fcntl",), ("EAGAIN", "EACCES", "ENOMEM", "EINTR")),
-    Call(("fchown",), ("EIO", "ENOSPC"), rare=True),
+    Call(("pread64",), ("EIO", "EINTR"), stores=True),
+    Call(("pwrite64",), ("ENOSPC", "EIO", "EINTR"), stores=True),
+    Call(("fdatasync", "fsync"), ("EIO", "ENOSPC", "EINTR"), stores=True),
+    Call(("fcntl",), ("EAGAIN", "EACCES", "ENOMEM", "EINTR"), stores=True),
+    Call(("fchown",), ("EIO", "ENOSPC"), rare=True, stores=True),
     # The stack of the helper that becomes the shell, stdio's and malloc's memory.
     Call(("mmap",), ("ENOMEM",), hides=True),
     Call(("munmap",), ("ENOMEM",)),
@@ -72,13 +74,16 @@ CALLS = (
     Call(("pselect6", "select"), ("EINTR", "ENOMEM")),
     Call(("clock_nanosleep", "nanosleep"), ("EINTR",)),
     # A pipe whose first byte cannot be read gives no message, and so no further calls.
-    Call(("read",), ("EIO", "EAGAIN", "EINTR"), stages=("files",)),
+    Call(("read",), ("EIO", "EAGAIN", "EINTR"), hides=True, stages=("files",)),
     Call(("socket",), ("EMFILE", "ENOMEM", "EACCES"), stages=("syslog",)),
     Call(("connect",), ("ECONNREFUSED", "EACCES", "EINTR"), stages=("syslog",)),
     Call(("sendto",), ("ENOMEM", "EAGAIN", "EINTR"), stages=("syslog",)),
-    Call(("mkdir", "mkdirat"), ("ENOSPC", "EIO", "ENOMEM"), stages=("planted",)),
-    Call(("rename", "renameat", "renameat2"), ("ENOSPC", "EIO", "EACCES"), stages=("planted",)),
-    Call(("rmdir",), ("EIO", "EACCES", "ENOMEM"), stages=("planted",)),
+    Call(("mkdir", "mkdirat"), ("ENOSPC", "EIO", "ENOMEM"), hides=True,
+         stages=("planted",)),
+    Call(("rename", "renameat", "renameat2"), ("ENOSPC", "EIO", "EACCES"), hides=True,
+         stages=("planted",)),
+    Call(("rmdir",), ("EIO", "EACCES", "ENOMEM"), hides=True,
+         stages=("planted",)),
 )
 
 # Calls without an error that a correct program can meet; brk has none at all, it

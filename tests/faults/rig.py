@@ -38,7 +38,12 @@ class Rig:
     # What a cycle is made of.
 
     def busy_cycle(self, enough=lambda: True):
-        """All that a cycle holds: removal, addition, mount, publication, rescan, safe removal.
+        """All that a cycle holds: removal, addition, mount, publication, rescan, safe removal."""
+        self.plug_cycle(enough)
+        self.safe_removal()
+
+    def plug_cycle(self, enough=lambda: True):
+        """Removal, addition, mount, publication and rescan.
 
         On a machine with much else to do it lasts until `enough` holds.
         """
@@ -49,19 +54,23 @@ class Rig:
             time.sleep(0.05)
         # Nothing was said of the other disk.
         assert self.world.mounted().get("/dev/sda1") == self.paths()["/dev/sda1"]
+
+    def safe_removal(self):
         self.world.safe_remove()
         time.sleep(AFTER_SAFE_REMOVAL)
 
-    def replug(self):
+    def replug(self, by_hand=True):
         """The disks go and come again, as far as the daemon is told.
 
         A disk that the daemon could not unmount while it was to forget it stays
-        mounted; on a router it goes with the device.
+        mounted; on a router it goes with the device, here by hand.
         """
         for disk in self.disks:
             self.world.send(f"#remove_dev:{disk.name}")
         self.answer()
-        for entry in self.world.mounts():
+        left = self.world.mounts()
+        assert by_hand or not left, f"{left} are left mounted"
+        for entry in left:
             self.world.run("umount", entry.path)
         for disk in self.disks:
             self.world.send(*add_messages(disk))
@@ -74,11 +83,11 @@ class Rig:
 
     # What must hold.
 
-    def check(self, fds_kept_open=0):
+    def check(self, fds_kept_open=0, by_hand=True):
         """After a fault: alive, no descriptor lost, and with the next plug all is right."""
         assert self.daemon.running, f"ended with {self.daemon.returncode}"
         self.answer()
-        self.replug()
+        self.replug(by_hand)
         self.wait_right()
         self.check_process(fds_kept_open)
 
@@ -89,16 +98,16 @@ class Rig:
         children = Path(f"/proc/{self.daemon.outer_pid}/task/{self.daemon.outer_pid}/children")
         self.world.wait(lambda: children.read_text() == "", 10, "no child of the daemon")
 
-    def wait_right(self, timeout=RECOVERY):
-        """Wait until inventory, mounts, files and rows are as they must be."""
+    def wait_right(self, timeout=RECOVERY, rows=True):
+        """Wait until inventory, mounts and files are as they must be, and the rows if wanted."""
         try:
-            self.world.wait(lambda: not self.wrong(), timeout, "")
+            self.world.wait(lambda: not self.wrong(rows), timeout, "")
         except WaitTimeout:
             if not self.daemon.running:
                 raise DaemonGone(f"ended with {self.daemon.returncode}") from None
-            raise AssertionError(f"after {timeout} s: {self.wrong()}") from None
+            raise AssertionError(f"after {timeout} s: {self.wrong(rows)}") from None
 
-    def wrong(self):
+    def wrong(self, rows=True):
         """What is not right, as a text; empty when all is."""
         parts = self._published()
         if parts != self.published:
@@ -109,7 +118,7 @@ class Rig:
             return "disk.json lacks the free space"
         if self.world.mounted() != self.paths():
             return f"{self.world.mounted()} is mounted, not {self.paths()}"
-        return database_fault(self.world) or self._wrong_rows()
+        return database_fault(self.world) or (self._wrong_rows() if rows else "")
 
     def paths(self):
         """{device path: mount path} as it must be."""

@@ -1,13 +1,15 @@
 """System calls of the daemon traced and made to fail, its commands left in peace."""
 
+import contextlib
 import signal
 import subprocess
 from pathlib import Path
 
-from world import wait_for
+from world import WaitTimeout, wait_for
 
 PROGRAM = "strace"
 _END = 15
+_QUIET = 1
 
 
 class Strace:
@@ -43,6 +45,10 @@ class Strace:
         return self
 
     def __exit__(self, *_):
+        # To leave in the middle of a call that fails would turn it into one that the
+        # kernel does not know.
+        with contextlib.suppress(WaitTimeout):
+            wait_for(self._between_cycles, _QUIET, "", 0.01)
         self._process.send_signal(signal.SIGTERM)
         self._process.communicate(timeout=_END)
 
@@ -60,6 +66,13 @@ class Strace:
         if self._process.poll() is not None:
             raise AssertionError(self._why_not())
         return _tracer(self._daemon.outer_pid) == self._process.pid
+
+    def _between_cycles(self):
+        try:
+            place = Path(f"/proc/{self._daemon.outer_pid}/wchan").read_text()
+        except OSError:
+            return True
+        return "select" in place or "poll" in place
 
     def _why_not(self):
         if self._process.poll() is None:
