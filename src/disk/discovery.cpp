@@ -30,7 +30,9 @@ void read_blkid_line(const char* dev_name, const char* dev_path, char (&text)[BL
     }
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_DEV_CHECK);
-    exec_cmd_into(command, SCRATCH_DEV_CHECK);
+    if (exec_cmd_into(command, SCRATCH_DEV_CHECK) < 0) {
+        return;
+    }
     file_read_buf(SCRATCH_DEV_CHECK, text, BLKID_TEXT_SIZE);
     file_delete(SCRATCH_DEV_CHECK);
 }

@@ -86,7 +86,7 @@ void log_mount(const mount_entry* entry)
 // memory say, must not cost the database.
 bool node_is_gone(const char* dev_path)
 {
-    return !path_exists(dev_path) && errno == ENOENT;
+    return !path_exists(dev_path) && (errno == ENOENT || errno == ENOTDIR);
 }
 
 // Anybody who may mount a userspace filesystem chooses names in the mount table.

@@ -40,9 +40,9 @@ int read_mount_table(mount_table* table)
     memset(table, 0, sizeof(*table));
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "mount > %s", SCRATCH_MOUNT);
-    exec_cmd_into(command, SCRATCH_MOUNT);
+    const bool listed = exec_cmd_into(command, SCRATCH_MOUNT) >= 0;
 
-    FILE* listing = fopen(SCRATCH_MOUNT, "re");
+    FILE* listing = listed ? fopen(SCRATCH_MOUNT, "re") : nullptr;
     if (listing == nullptr) {
         log_err("err, fn = %s\n", SCRATCH_MOUNT);
         return 1;

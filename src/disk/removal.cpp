@@ -14,6 +14,9 @@
 
 namespace {
 
+// Someone is about to pull the disks: a look that broke off is repeated.
+constexpr int SYS_BLOCK_WALKS = 3;
+
 void run_umount(const char* target)
 {
     if (!path_is_shell_safe(target)) {
@@ -168,15 +171,20 @@ int safe_remove_all(disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
-    dir_stream dir(SYS_BLOCK);
-    if (dir.stream == nullptr) {
-        log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return 1;
-    }
-    while (const char* name = dir.next_name()) {
-        if (dev_name_is_disk(name) == 0) {
-            remove_dev(sets, name);
+    for (int i = 0; i < SYS_BLOCK_WALKS; ++i) {
+        dir_stream dir(SYS_BLOCK);
+        if (dir.stream == nullptr) {
+            log_err("open dir err, dir = %s\n", SYS_BLOCK);
+            return 1;
+        }
+        while (const char* name = dir.next_name()) {
+            if (dev_name_is_disk(name) == 0) {
+                remove_dev(sets, name);
+            }
+        }
+        if (!dir.failed) {
+            return 0;
         }
     }
-    return 0;
+    return 1;
 }

@@ -108,8 +108,9 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
 {
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_BLKID_TYPE);
-    exec_cmd_into(command, SCRATCH_BLKID_TYPE);
-
+    if (exec_cmd_into(command, SCRATCH_BLKID_TYPE) < 0) {
+        return 1;
+    }
     char* text = file_read_all(SCRATCH_BLKID_TYPE);
     if (text == nullptr) {
         return 1;

@@ -5,6 +5,7 @@
 #include "main/signals.h"
 #include "main/single_instance.h"
 #include "manager/manager.h"
+#include "manager/signal_inbox.h"
 #include "util/file.h"
 #include "util/paths.h"
 
@@ -25,6 +26,7 @@ int run_block_input_mode(int argc, char* argv[])
         manager_event_loop(manager);
     }
     manager_free(manager);
+    signal_inbox_report();
     file_delete(PID_FILE);
     if (restart_requested != 0) {
         restart_self();

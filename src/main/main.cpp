@@ -8,6 +8,7 @@
 #include "main/signals.h"
 #include "main/single_instance.h"
 #include "manager/manager.h"
+#include "manager/signal_inbox.h"
 #include "util/file.h"
 #include "util/paths.h"
 
@@ -23,6 +24,7 @@ void run_daemon()
         manager_run(manager);
     }
     manager_free(manager);
+    signal_inbox_report();
     log_file_close();
     file_delete(PID_FILE);
     // After the pid file is gone: the new instance must not take us for a second one.

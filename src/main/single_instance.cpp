@@ -24,7 +24,9 @@ void list_daemon_pids(char (&list)[PID_LIST_SIZE + 1])
     file_delete(SCRATCH_PGREP);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "pgrep -f tarn_nas_diskmanager > %s", SCRATCH_PGREP);
-    exec_cmd_into(command, SCRATCH_PGREP);
+    if (exec_cmd_into(command, SCRATCH_PGREP) < 0) {
+        return;
+    }
     file_read_buf(SCRATCH_PGREP, list, PID_LIST_SIZE);
     file_delete(SCRATCH_PGREP);
 }
@@ -63,7 +65,9 @@ int check_single_instance()
 
 void write_pid_file()
 {
-    dir_make_own(RUNTIME_DIR);
+    if (dir_make_own(RUNTIME_DIR) != 0) {
+        return;
+    }
     char text[PID_TEXT_SIZE];
     text_format(text, sizeof(text), "%d", static_cast<int>(getpid()));
     file_write(PID_FILE, text, static_cast<int32_t>(strlen(text)));

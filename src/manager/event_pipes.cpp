@@ -111,8 +111,10 @@ int event_pipes_open(event_pipes* pipes)
     if (pipes == nullptr) {
         return 1;
     }
-    dir_make_own(RUNTIME_DIR);
     memset(pipes, 0, sizeof(*pipes));
+    if (dir_make_own(RUNTIME_DIR) != 0) {
+        return 1;
+    }
 
     struct pipe_place {
         const char* path;

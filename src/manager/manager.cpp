@@ -258,7 +258,6 @@ int manager_event_loop(disk_manager* manager)
             manager_idle(manager);
         }
     }
-    signal_inbox_report();
     return 0;
 }
 

@@ -38,11 +38,7 @@ bool read_block_names(block_names* list)
         }
     }
     // Half a list would take the disks that it lacks for pulled ones.
-    if (dir.failed) {
-        log_errno("read dir err, dir = %s\n", SYS_BLOCK);
-        return false;
-    }
-    return true;
+    return !dir.failed;
 }
 
 bool holds(const block_names& list, const char* name)

@@ -44,8 +44,9 @@ uint64_t to_number(const char* text)
 void query_blkid(const char* command, const char* dev_name, const char* key, char* out, size_t size)
 {
     memset(out, 0, size);
-    exec_cmd_into(command, SCRATCH_BLKID_VALUE);
-
+    if (exec_cmd_into(command, SCRATCH_BLKID_VALUE) < 0) {
+        return;
+    }
     char* text = file_read_all(SCRATCH_BLKID_VALUE);
     // The key matches anywhere, so a longer key that ends the same and stands first wins.
     const char* value = text != nullptr ? text_quoted_value(text, key) : nullptr;
@@ -191,8 +192,9 @@ int script_get_label(const char* dev_name, char* out, size_t size)
     file_delete(SCRATCH_LABEL);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "%s %s > %s", LABEL_SCRIPT, dev_name, SCRATCH_LABEL);
-    exec_cmd_into(command, SCRATCH_LABEL);
-
+    if (exec_cmd_into(command, SCRATCH_LABEL) != 0) {
+        return 1;
+    }
     char text[LABEL_TEXT_SIZE + 1]{};
     if (file_read_buf(SCRATCH_LABEL, text, LABEL_TEXT_SIZE) != 0) {
         return 1;

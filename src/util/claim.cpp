@@ -18,14 +18,13 @@ namespace {
 // Somebody may put a new thing there between our steps; nobody can for ever.
 constexpr int CLAIM_TRIES = 100;
 constexpr mode_t PRIVATE_MODE = 0600;
-constexpr char ASIDE_TEMPLATE[] = "/tmp/foreign-XXXXXX";
 
 // A directory that others filled is not deleted: that walk could be led astray. It goes into a
 // directory that only we can enter.
 int move_aside(const char* path)
 {
-    char place[sizeof(ASIDE_TEMPLATE)];
-    text_copy(place, ASIDE_TEMPLATE);
+    char place[sizeof(SET_ASIDE_TEMPLATE)];
+    text_copy(place, SET_ASIDE_TEMPLATE);
     if (mkdtemp(place) == nullptr) {
         log_errno("mkdtemp err, path = %s\n", path);
         return 1;
@@ -33,9 +32,13 @@ int move_aside(const char* path)
     char target[PATH_SIZE];
     text_format(target, sizeof(target), "%s/entry", place);
     if (rename(path, target) != 0) {
-        log_errno("rename err, path = %s\n", path);
+        // Its owner may have been faster; the name is free then.
+        const bool is_free = errno == ENOENT;
+        if (!is_free) {
+            log_errno("rename err, path = %s\n", path);
+        }
         rmdir(place);
-        return 1;
+        return is_free ? 0 : 1;
     }
     log_warn("foreign path %s --> %s\n", path, target);
     return 0;
@@ -84,20 +87,23 @@ int claim_file(const char* path)
     return 1;
 }
 
-bool path_is_foreign(const char* path)
+path_owner path_get_owner(const char* path)
 {
     if (path == nullptr) {
-        return false;
+        return PATH_OF_NOBODY;
     }
     char name[PATH_SIZE];
     text_copy_without_slash(name, path);
     struct stat info {};
-    return lstat(name, &info) == 0 && info.st_uid != geteuid();
+    if (lstat(name, &info) != 0) {
+        return PATH_OF_NOBODY;
+    }
+    return info.st_uid == geteuid() ? PATH_OURS : PATH_FOREIGN;
 }
 
 int claim_path(const char* path)
 {
-    if (!path_is_foreign(path)) {
+    if (path_get_owner(path) != PATH_FOREIGN) {
         return 0;
     }
     char name[PATH_SIZE];

@@ -6,8 +6,14 @@
 // /tmp is sticky, nobody else can take it away again. 0, or 1 when it cannot be made.
 int claim_file(const char* path);
 
-// True when what lies at path, a link itself and not its target, belongs to another user.
-bool path_is_foreign(const char* path);
+enum path_owner {
+    PATH_OF_NOBODY,  // nothing is there, or it cannot be told
+    PATH_OURS,
+    PATH_FOREIGN,
+};
+
+// Whose the thing at path is; of a link itself, not of its target.
+path_owner path_get_owner(const char* path);
 
 // Moves a foreign thing at path aside. 0 when nothing foreign is left there, else 1.
 int claim_path(const char* path);

@@ -51,7 +51,7 @@ int exec_cmd(const char* command, int attempts, const char* file, int line)
 int exec_cmd_into(const char* command, const char* path, const char* file, int line)
 {
     if (claim_file(path) != 0) {
-        return 1;
+        return -1;
     }
     return exec_cmd(command, 1, file, line);
 }

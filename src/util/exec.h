@@ -9,7 +9,8 @@ int exec_cmd(const char* command, int attempts, const char* file = __builtin_FIL
 
 // exec_cmd, once, of a command that redirects its output into the scratch file at path. An empty
 // file of ours takes the place of whatever lies there first, so that the shell follows no planted
-// link. 1 also when that file cannot be made.
+// link. -1, and the command does not run, when that cannot be done: what then lies at path is not
+// to be read.
 int exec_cmd_into(const char* command, const char* path, const char* file = __builtin_FILE(),
                   int line = __builtin_LINE());
 

@@ -59,6 +59,9 @@ const char* dir_stream::next_name()
     errno = 0;
     const dirent* entry = readdir(stream);
     failed = entry == nullptr && errno != 0;
+    if (failed) {
+        log_errno("read dir err\n");
+    }
     return entry != nullptr ? entry->d_name : nullptr;
 }
 
@@ -279,12 +282,13 @@ int dir_make_own(const char* path)
         if (claim_path(path) != 0) {
             return 1;
         }
-        const int ret = dir_make(path);
+        dir_make(path);
         // Making is content with what somebody else made a moment earlier.
-        if (!path_is_foreign(path)) {
-            return ret;
+        if (path_get_owner(path) == PATH_OURS) {
+            return 0;
         }
     }
+    log_err("err, dir = %s\n", path);
     return 1;
 }
 

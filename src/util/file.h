@@ -20,7 +20,7 @@ struct dir_stream {
     dir_stream(const dir_stream&) = delete;
     dir_stream& operator=(const dir_stream&) = delete;
 
-    // Reading broke off: what came so far is not the whole directory.
+    // Reading broke off, which is logged: what came so far is not the whole directory.
     bool failed = false;
 
     // The next entry's name, valid until the next call; null after the last, or when reading
@@ -64,7 +64,8 @@ int file_delete(const char* path);
 // mkdir -p; anything that exists at path counts as success. No single quote may stand in path.
 int dir_make(const char* path);
 
-// dir_make of a directory in /tmp that must be ours: somebody else's is moved aside first.
+// dir_make of a directory in /tmp that must be ours: somebody else's is moved aside first. 0 only
+// when what is there then is ours.
 int dir_make_own(const char* path);
 
 // Makes the FIFO (mode 0600) when path is missing and opens it for reading and writing without

@@ -9,11 +9,26 @@ namespace {
 
 constexpr size_t MOUNT_BASE_LENGTH = sizeof(MOUNT_BASE) - 1;
 
-// The slash first: a name is a path without it.
-constexpr char PATH_CHARACTERS[] = "/abcdefghijklmnopqrstuvwxyz"
+constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
                                    "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
                                    "0123456789._-!";
-constexpr const char* NAME_CHARACTERS = PATH_CHARACTERS + 1;
+
+// What a shell takes as it stands inside a word, beside the characters of names and those of UTF-8.
+constexpr char PATH_PUNCTUATION[] = "/+,:@%=";
+
+bool is_plain_in_path(char c)
+{
+    const bool ascii = static_cast<unsigned char>(c) < 0x80;
+    return !ascii || strchr(NAME_CHARACTERS, c) != nullptr ||
+           strchr(PATH_PUNCTUATION, c) != nullptr;
+}
+
+bool climbs(const char* path)
+{
+    const size_t length = strlen(path);
+    const bool ends_up = length >= 3 && strcmp(path + length - 3, "/..") == 0;
+    return ends_up || strstr(path, "/../") != nullptr;
+}
 
 }  // namespace
 
@@ -83,5 +98,10 @@ bool name_is_shell_safe(const char* name)
 
 bool path_is_shell_safe(const char* path)
 {
-    return path[strspn(path, PATH_CHARACTERS)] == '\0';
+    for (const char* c = path; *c != '\0'; ++c) {
+        if (!is_plain_in_path(*c)) {
+            return false;
+        }
+    }
+    return !climbs(path);
 }

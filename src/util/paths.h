@@ -33,6 +33,9 @@ inline constexpr char SCRATCH_BLKID_TYPE[] = "/tmp/out.txt";
 inline constexpr char SCRATCH_BLKID_VALUE[] = "/tmp/disk_uid.txt";
 inline constexpr char SCRATCH_LABEL[] = "/tmp/disk_label";
 
+// Where things go that others left under our names; mkdtemp fills in the end.
+inline constexpr char SET_ASIDE_TEMPLATE[] = "/tmp/foreign-XXXXXX";
+
 // An optional program of the router: prints the label of the device named by its argument.
 inline constexpr char LABEL_SCRIPT[] = "/usr/bin/disk_get_label.sh";
 
@@ -67,5 +70,5 @@ bool mount_path_is_usable(const char* path);
 // characters . _ - and !. Only such a name may become part of a shell command.
 bool name_is_shell_safe(const char* name);
 
-// The same of a whole path.
+// True when an absolute path is one plain word to a shell and climbs nowhere ("..").
 bool path_is_shell_safe(const char* path);

@@ -13,8 +13,9 @@ int proc_pid_of(const char* name)
     file_delete(SCRATCH_PIDOF);
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "pidof %s > %s", name, SCRATCH_PIDOF);
-    exec_cmd_into(command, SCRATCH_PIDOF);
-
+    if (exec_cmd_into(command, SCRATCH_PIDOF) < 0) {
+        return 0;
+    }
     char* text = file_read_all(SCRATCH_PIDOF);
     if (text == nullptr) {
         return 0;

@@ -121,10 +121,11 @@ def test_a_command_in_the_name_of_an_event_is_not_run(world, daemon):
     for text in COMMANDS:
         for event in ("add", "remove_dev", "remove_disk"):
             mark = daemon.mark()
-            world.send_bytes(f"#{event}:sda{text[:20]}".replace(";", "&").encode() + b"\n")
+            # A semicolon would end the message.
+            world.send_bytes(f"#{event}:sda{text}".replace(";", "&").encode() + b"\n")
             daemon.wait_log("===> get event = ", since=mark)
     daemon.wait_idle_cycles(1)
-    assert not world.exists(HARM) and not world.exists("/tmp/h")
+    assert not world.exists(HARM)
 
 
 @pytest.mark.needs_fs("ext4")

@@ -1,13 +1,22 @@
 #include "util/claim.h"
 
 #include <gtest/gtest.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 
+#include <cerrno>
+#include <cstring>
 #include <filesystem>
 
+#include "disk/discovery.h"
+#include "disk/mount_table.h"
+#include "fs/fs_type.h"
 #include "support/support.h"
+#include "util/block_dev.h"
 #include "util/exec.h"
 #include "util/file.h"
+#include "util/paths.h"
+#include "util/process.h"
 
 using support::log_of;
 using support::read_file;
@@ -140,7 +149,7 @@ TEST_F(Claim, somebody_elses_directory_is_moved_aside)
 {
     write_file(std::string(PLACE) + "/disk.json", "forged");
     ASSERT_EQ(chown(PLACE, STRANGER, STRANGER), 0);
-    EXPECT_TRUE(path_is_foreign("/tmp/scratch/"));
+    EXPECT_EQ(path_get_owner("/tmp/scratch/"), PATH_FOREIGN);
     EXPECT_EQ(claim_path("/tmp/scratch/"), 0);
     EXPECT_FALSE(std::filesystem::exists(PLACE));
     EXPECT_EQ(set_aside().size(), 1U);
@@ -154,7 +163,7 @@ TEST_F(Claim, somebody_elses_link_is_moved_aside_and_roots_own_is_used)
     EXPECT_TRUE(std::filesystem::is_symlink(PLACE));
 
     ASSERT_EQ(lchown(PLACE, STRANGER, STRANGER), 0);
-    EXPECT_TRUE(path_is_foreign("/tmp/scratch/"));
+    EXPECT_EQ(path_get_owner("/tmp/scratch/"), PATH_FOREIGN);
     EXPECT_EQ(claim_path("/tmp/scratch/"), 0);
     EXPECT_FALSE(std::filesystem::is_symlink(PLACE));
     EXPECT_TRUE(std::filesystem::is_directory("/run/elsewhere"));
@@ -167,7 +176,7 @@ TEST_F(Claim, a_directory_of_ours_takes_the_place_of_somebody_elses)
     ASSERT_EQ(chown(PLACE, STRANGER, STRANGER), 0);
     log_of([] { EXPECT_EQ(dir_make_own("/tmp/scratch/"), 0); });
     EXPECT_TRUE(std::filesystem::is_directory(PLACE));
-    EXPECT_FALSE(path_is_foreign(PLACE));
+    EXPECT_EQ(path_get_owner(PLACE), PATH_OURS);
     EXPECT_TRUE(std::filesystem::is_empty(PLACE));
 }
 
@@ -185,8 +194,47 @@ TEST_F(Claim, a_commands_output_goes_into_a_file_of_ours_and_not_through_a_plant
 TEST_F(Claim, a_command_whose_output_has_no_place_does_not_run)
 {
     const std::string log = log_of([] {
-        EXPECT_EQ(exec_cmd_into("touch /tmp/ran > /tmp/none/scratch", "/tmp/none/scratch"), 1);
+        EXPECT_EQ(exec_cmd_into("touch /tmp/ran > /tmp/none/scratch", "/tmp/none/scratch"), -1);
     });
     EXPECT_FALSE(support::contains(log, "exec cmd")) << log;
     EXPECT_FALSE(std::filesystem::exists("/tmp/ran"));
+}
+
+TEST_F(Claim, a_forged_answer_that_cannot_be_taken_away_is_not_read)
+{
+    // A mount on the name cannot be unlinked.
+    write_file("/run/forged", "/dev/sda1 on /tmp/mountd/disk1_part1 type ext4\n4711\n");
+    const char* const names[] = {SCRATCH_MOUNT, SCRATCH_PIDOF, SCRATCH_BLKID_TYPE,
+                                 SCRATCH_BLKID_VALUE, SCRATCH_DEV_CHECK};
+    for (const char* name : names) {
+        write_file(name, "");
+        ASSERT_EQ(mount("/run/forged", name, nullptr, MS_BIND, nullptr), 0) << strerror(errno);
+    }
+    support::stub_programs stubs;
+    for (const char* program : {"mount", "pidof", "blkid"}) {
+        stubs.add(program);
+    }
+    log_of([] {
+        mount_table table;
+        EXPECT_EQ(read_mount_table(&table), 1);
+        EXPECT_EQ(table.num, 0);
+        EXPECT_EQ(proc_pid_of("tarn_nas_sys"), 0);
+        char text[64];
+        EXPECT_EQ(fs_blkid_type("/dev/sda1", text, sizeof(text)), 1);
+        blkid_get_value("sda1", "/dev", text, sizeof(text));
+        EXPECT_STREQ(text, "");
+        EXPECT_EQ(dev_check_blkid("sda1"), 1);
+    });
+    EXPECT_TRUE(stubs.calls().empty());
+    for (const char* name : names) {
+        EXPECT_EQ(umount2(name, MNT_DETACH), 0);
+        support::remove_all(name);
+    }
+}
+
+TEST_F(Claim, a_directory_that_cannot_be_made_ours_is_told)
+{
+    // mkdir has nothing to make it in.
+    const std::string log = log_of([] { EXPECT_EQ(dir_make_own("/proc/none/x"), 1); });
+    EXPECT_TRUE(support::contains(log, "err, dir = /proc/none/x")) << log;
 }

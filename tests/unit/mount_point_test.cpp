@@ -242,7 +242,7 @@ TEST_F(MountPoint, names_in_the_mount_table_that_a_shell_would_read_reach_no_com
 {
     add_mount("/dev/sd;touch$IFS/run/harm;", "/tmp/mountd/disk1_part1");
     add_mount("/dev/sdb1", "/home/u/tmp/mountd/$(touch$IFS/run/harm)");
-    add_mount("/dev/sdc1", "/tmp/mountd/a\\040b");
+    add_mount("/dev/sdc1", "/tmp/mountd/../../overlay");
     const std::string log = capture_stdout([] { umount_all_force(); });
     EXPECT_EQ(actions(), (std::vector<std::string>{"umount -f /tmp/mountd/disk1_part1",
                                                    "umount -f /dev/sdb1", "umount -f /dev/sdc1"}));

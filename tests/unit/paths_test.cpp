@@ -173,12 +173,14 @@ TEST(NameIsShellSafe, RefusesWhatTheShellWouldRead)
     }
 }
 
-TEST(PathIsShellSafe, TakesSlashesBesideTheCharactersOfNames)
+TEST(PathIsShellSafe, TakesWhatIsOnePlainWord)
 {
-    for (const char* path : {"/dev/sda1", "/tmp/mountd/disk1_part1", "/", ""}) {
+    for (const char* path : {"/dev/sda1", "/tmp/mountd/disk1_part1", "/", "", "/tmp/a+b,c:d@e%f=g",
+                             "/tmp/b\xc3\xbcro", "/tmp/..x", "/tmp/x..", "/tmp/.../y"}) {
         EXPECT_TRUE(path_is_shell_safe(path)) << path;
     }
-    for (const char* path : {"/dev/sda1;x", "/tmp/a b", "/tmp/$x", "/tmp/a\\040b", "/tmp/a\n"}) {
+    for (const char* path : {"/dev/sda1;x", "/tmp/a b", "/tmp/$x", "/tmp/a\\040b", "/tmp/a\n",
+                             "/tmp/mountd/../../overlay", "/tmp/mountd/..", "/tmp/~x", "/tmp/a*"}) {
         EXPECT_FALSE(path_is_shell_safe(path)) << path;
     }
 }
