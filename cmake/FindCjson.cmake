@@ -1,4 +1,5 @@
-# Finds cJSON and defines the imported target cjson::cjson. Include it as <cjson/cJSON.h>.
+# Finds cJSON and defines the imported target cjson::cjson. Include it as <cjson/cJSON.h>. Version 1.7.13 or later: only
+# these tell when an item could not be added.
 
 find_path(Cjson_INCLUDE_DIR cjson/cJSON.h)
 find_library(Cjson_LIBRARY cjson)
