@@ -7,12 +7,13 @@ import signal
 import subprocess
 import sys
 import threading
-import time
 from collections import Counter
 from pathlib import Path
 
 import pytest
 from whole_lines import broken_lines, is_announcement, is_foreign
+
+from world import wait_for
 
 pytestmark = pytest.mark.needs_fs("ext2")
 
@@ -93,6 +94,11 @@ class Bustle(threading.Thread):
         self.join(70)
 
 
+def waits_since(daemon, mark):
+    log = daemon.log_since(mark)
+    return sum(log.count(text) for text in WAITS)
+
+
 def send_sigint_until_told(daemon, told):
     """One SIGINT more in the log.
 
@@ -102,12 +108,8 @@ def send_sigint_until_told(daemon, told):
     while daemon.running and daemon.log().count("get sig = SIGINT") < told:
         mark = daemon.mark()
         daemon.signal(signal.SIGINT)
-        for _ in range(2):
-            waits = sum(daemon.log_since(mark).count(text) for text in WAITS)
-            deadline = time.monotonic() + 90
-            while daemon.running and time.monotonic() < deadline and waits >= sum(
-                    daemon.log_since(mark).count(text) for text in WAITS):
-                time.sleep(0.02)
+        wait_for(lambda: not daemon.running or waits_since(daemon, mark) >= 2, 240,
+                 "two waits of the loop behind a SIGINT")
 
 
 def reported(log):
