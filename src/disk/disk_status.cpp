@@ -136,6 +136,7 @@ int disk_status_write_json(disk_sets* sets)
         return 1;
     }
     add_number(root, "disk_number", disk_sets_count(sets));
+    // Without its list a document says nothing: the old file stays.
     if (!add_item(root, "disk", disks)) {
         cJSON_Delete(root);
         return 1;
