@@ -5,6 +5,7 @@
 #include <sys/vfs.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdlib>
 #include <cstring>
 
@@ -35,6 +36,12 @@ int free_descriptor()
     return fd;
 }
 
+// Bytes beyond ASCII mean nothing to a shell.
+bool is_plain(char c)
+{
+    return (c & 0x80) != 0 || (c != '\0' && strchr(PLAIN_CHARACTERS, c) != nullptr);
+}
+
 // Only words, and one pair of quotes around a directory to make: nothing that a disk, an event, a
 // row or a listing says may mean anything to the shell.
 void require_plain(const std::string& command)
@@ -44,7 +51,7 @@ void require_plain(const std::string& command)
     if (words.rfind(quoted, 0) == 0 && words.back() == '\'') {
         words = words.substr(quoted.size(), words.size() - quoted.size() - 1);
     }
-    const bool plain = words.find_first_not_of(PLAIN_CHARACTERS) == std::string::npos;
+    const bool plain = std::all_of(words.begin(), words.end(), is_plain);
     if (!plain) {
         fprintf(stderr, "command: %s\n", command.c_str());
     }

@@ -27,7 +27,8 @@ HOSTILE = [
 
 MOUNT_PATHS = [
     b"/tmp/mountd/disk1_part1", b"/tmp/mountd/disk12_part3", b"/tmp/mountd/disk1_part1/sub", b"/tmp/mountd",
-    b"/tmp/mountd/", b"/tmp/mountd/.", b"/tmp/mountd/..", b"/tmp/mountd/a;reboot", b"/tmp/mountd/$(reboot)",
+    b"/tmp/mountd/", b"/tmp/mountd/.", b"/tmp/mountd/..", b"/tmp/mountd/../x",
+    b"/tmp/mountd/a;reboot", b"/tmp/mountd/$(reboot)",
     b"/tmp/mountd/a b", b"/tmp/mountd/a\nb", b"/tmp/mountdx", b"/etc", b"", b"/tmp/mountd/usbdisk",
     b"/tmp/mountd/disk99999999999999999999_part4294967296", b"/tmp/mountd/" + b"y" * 120, b"/tmp/mountd/_1_2",
 ]

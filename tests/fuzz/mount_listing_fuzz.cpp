@@ -190,6 +190,7 @@ std::string fuzz_answer(const std::string& command)
         return listing;
     }
     require(text_has_prefix(command.c_str(), "umount "), "nothing but an unmount is run");
+    require((command + "/").find("/../") == std::string::npos, "no path climbs");
     if (unmounts_refused-- == 0) {
         listing = "\n";
     }
