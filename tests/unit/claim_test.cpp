@@ -208,7 +208,7 @@ TEST_F(Claim, a_forged_answer_that_cannot_be_taken_away_is_not_read)
                                  SCRATCH_BLKID_VALUE, SCRATCH_DEV_CHECK};
     for (const char* name : names) {
         write_file(name, "");
-        ASSERT_EQ(mount("/run/forged", name, nullptr, MS_BIND, nullptr), 0) << strerror(errno);
+        ASSERT_EQ(mount("/run/forged", name, "none", MS_BIND, nullptr), 0) << strerror(errno);
     }
     support::stub_programs stubs;
     for (const char* program : {"mount", "pidof", "blkid"}) {

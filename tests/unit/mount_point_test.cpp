@@ -225,6 +225,7 @@ TEST_F(MountPoint, a_device_that_cannot_be_looked_at_is_not_taken_for_gone)
     ASSERT_EQ(symlink("/dev/sdb", "/dev/sdb"), 0);
     add_mount("/dev/sdb", "/tmp/mountd/disk2_part1");
     EXPECT_EQ(check_mount_dev_exist(), 0);
+    support::remove_all("/dev/sdb");
 }
 
 TEST_F(MountPoint, the_forced_unmount_names_each_device_and_then_its_path)
