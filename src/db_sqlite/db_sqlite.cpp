@@ -16,6 +16,18 @@ int log_code_and_error(sqlite_handle* handle, int code)
     return 1;
 }
 
+int bind_all(sqlite3_stmt* stmt, std::span<const char* const> values)
+{
+    int index = 0;
+    for (const char* value : values) {
+        const int code = sqlite3_bind_text(stmt, ++index, value, -1, SQLITE_STATIC);
+        if (code != SQLITE_OK) {
+            return code;
+        }
+    }
+    return SQLITE_OK;
+}
+
 void clear(sqlite_handle* handle)
 {
     handle->db = nullptr;
@@ -92,6 +104,25 @@ int db_exec(sqlite_handle* handle, const char* sql)
     return code == SQLITE_OK ? 0 : 1;
 }
 
+int db_exec_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values)
+{
+    if (handle == nullptr || handle->db == nullptr || sql == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    const bool done = sqlite3_prepare(handle->db, sql, -1, &handle->stmt, nullptr) == SQLITE_OK &&
+                      bind_all(handle->stmt, values) == SQLITE_OK &&
+                      sqlite3_step(handle->stmt) == SQLITE_DONE;
+    // The step itself only says that something failed; finalizing tells what.
+    sqlite3_finalize(handle->stmt);
+    handle->stmt = nullptr;
+    if (!done) {
+        log_err("err str = %s\n", sqlite3_errmsg(handle->db));
+        db_log_error(handle);
+    }
+    return done ? 0 : 1;
+}
+
 int db_prepare(sqlite_handle* handle, const char* sql)
 {
     if (handle == nullptr || handle->db == nullptr || sql == nullptr) {
@@ -109,10 +140,18 @@ int db_prepare(sqlite_handle* handle, const char* sql)
     return 0;
 }
 
-int db_bind_text(sqlite_handle* handle, int index, const char* text)
+int db_prepare_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values)
 {
-    const int code = sqlite3_bind_text(handle->stmt, index, text, -1, SQLITE_STATIC);
-    return code == SQLITE_OK ? 0 : log_code_and_error(handle, code);
+    if (db_prepare(handle, sql) != 0) {
+        return 1;
+    }
+    const int code = bind_all(handle->stmt, values);
+    if (code != SQLITE_OK) {
+        log_code_and_error(handle, code);
+        db_finalize(handle);
+        return 1;
+    }
+    return 0;
 }
 
 int db_step_is_one(sqlite_handle* handle)
@@ -132,19 +171,6 @@ int db_step_is_one(sqlite_handle* handle)
     }
     db_finalize(handle);
     return value == 1 ? 1 : 0;
-}
-
-int db_step_done(sqlite_handle* handle)
-{
-    const bool done = sqlite3_step(handle->stmt) == SQLITE_DONE;
-    // The step itself only says that something failed; finalizing tells what.
-    sqlite3_finalize(handle->stmt);
-    handle->stmt = nullptr;
-    if (!done) {
-        log_err("err str = %s\n", sqlite3_errmsg(handle->db));
-        db_log_error(handle);
-    }
-    return done ? 0 : 1;
 }
 
 int db_table_exists(sqlite_handle* handle, const char* table)

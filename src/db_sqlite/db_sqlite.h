@@ -4,6 +4,8 @@
 
 #include <sqlite3.h>
 
+#include <span>
+
 // Owned by its caller. Finalize before preparing the next statement.
 struct sqlite_handle {
     sqlite3* db;         // null when closed
@@ -24,18 +26,18 @@ int db_finalize(sqlite_handle* handle);
 // Runs a whole SQL text without looking at rows.
 int db_exec(sqlite_handle* handle, const char* sql);
 
+// db_exec of one statement with its parameters bound to values, in order.
+int db_exec_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values);
+
 // Prepares the SQL text as the handle's statement.
 int db_prepare(sqlite_handle* handle, const char* sql);
 
-// Binds text to the statement's parameter number index (from 1). text must outlive the statement.
-int db_bind_text(sqlite_handle* handle, int index, const char* text);
+// db_prepare with the statement's parameters bound to values, which must outlive the statement.
+int db_prepare_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values);
 
 // Runs the prepared statement and finalizes it in every case. 1 when the last integer of its last
 // row is exactly 1, 0 when it is not or there is no row, -1 on error.
 int db_step_is_one(sqlite_handle* handle);
-
-// Runs a prepared statement that gives no rows, and finalizes it in every case.
-int db_step_done(sqlite_handle* handle);
 
 // 0 when the table exists, 1 when it does not, -1 on error.
 int db_table_exists(sqlite_handle* handle, const char* table);

@@ -1,6 +1,7 @@
 #include "disk/disk_db.h"
 
 #include <cstring>
+#include <span>
 
 #include "log/log.h"
 #include "util/file.h"
@@ -71,31 +72,25 @@ void build_statement(char (&out)[STATEMENT_SIZE], const char* format, const valu
     builder.append(rest, strlen(rest));
 }
 
-int prepare_bound(sqlite_handle* handle, const char* format, const value_list& values)
+std::span<const char* const> bound_values(const value_list& values)
+{
+    return {values.values, static_cast<size_t>(values.count)};
+}
+
+int prepare_select(sqlite_handle* handle, const char* format, const value_list& values)
 {
     char sql[STATEMENT_SIZE];
     build_statement(sql, format, nullptr);
-    if (db_prepare(handle, sql) != 0) {
-        return 1;
-    }
-    for (int i = 0; i < values.count; ++i) {
-        if (db_bind_text(handle, i + 1, values.values[i]) != 0) {
-            db_finalize(handle);
-            return 1;
-        }
-    }
-    return 0;
+    return db_prepare_bound(handle, sql, bound_values(values));
 }
 
 int run_statement(sqlite_handle* handle, const char* format, const value_list& values)
 {
-    char readable[STATEMENT_SIZE];
-    build_statement(readable, format, &values);
-    log_info("sql = \n%s\n", readable);
-    if (prepare_bound(handle, format, values) != 0) {
-        return 1;
-    }
-    return db_step_done(handle);
+    char sql[STATEMENT_SIZE];
+    build_statement(sql, format, &values);
+    log_info("sql = \n%s\n", sql);
+    build_statement(sql, format, nullptr);
+    return db_exec_bound(handle, sql, bound_values(values));
 }
 
 int run_update(sqlite_handle* handle, const char* format, const value_list& values)
@@ -200,7 +195,7 @@ int disk_table_uid_exists(const char* uid, sqlite_handle* handle)
         log_err("err!\n");
         return -1;
     }
-    if (prepare_bound(handle, COUNT_UID, {{uid}, 1}) != 0) {
+    if (prepare_select(handle, COUNT_UID, {{uid}, 1}) != 0) {
         log_err("err!\n");
         return -1;
     }
@@ -213,7 +208,7 @@ int disk_table_select(const char* uid, disk_db_record* record, sqlite_handle* ha
         log_err("err!\n");
         return 1;
     }
-    if (prepare_bound(handle, SELECT_UID, {{uid}, 1}) != 0) {
+    if (prepare_select(handle, SELECT_UID, {{uid}, 1}) != 0) {
         log_err("err!\n");
         return -1;
     }

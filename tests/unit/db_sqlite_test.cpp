@@ -307,21 +307,35 @@ TEST_F(Database, TheLastErrorIsLoggedWithCodeAndMessage)
 TEST_F(Database, TextIsBoundAndTakenAsItStands)
 {
     open_with_table();
-    ASSERT_EQ(db_prepare(&handle, "insert into disk (id, uuid) values (1, ?)"), 0);
-    EXPECT_EQ(db_bind_text(&handle, 1, "it's; drop table disk"), 0);
-    EXPECT_EQ(db_step_done(&handle), 0);
+    const char* const hostile[] = {"it's; drop table disk"};
+    EXPECT_EQ(db_exec_bound(&handle, "insert into disk (id, uuid) values (1, ?)", hostile), 0);
     EXPECT_EQ(handle.stmt, nullptr);
-    ASSERT_EQ(db_prepare(&handle, "select count(*) from disk where uuid = ?"), 0);
-    EXPECT_EQ(db_bind_text(&handle, 1, "it's; drop table disk"), 0);
+    ASSERT_EQ(db_prepare_bound(&handle, "select count(*) from disk where uuid = ?", hostile), 0);
     EXPECT_EQ(db_step_is_one(&handle), 1);
 }
 
 TEST_F(Database, AParameterThatDoesNotExistCannotBeBound)
 {
     open_with_table();
-    ASSERT_EQ(db_prepare(&handle, "select 1"), 0);
-    std::string log = log_of([&] { EXPECT_EQ(db_bind_text(&handle, 1, "x"), 1); });
+    const char* const values[] = {"x"};
+    std::string log = log_of([&] { EXPECT_EQ(db_prepare_bound(&handle, "select 1", values), 1); });
     EXPECT_TRUE(contains(log, ERR + "err code = 25\n")) << log;
+    EXPECT_EQ(handle.stmt, nullptr);
+
+    log = log_of([&] { EXPECT_EQ(db_exec_bound(&handle, "delete from disk", values), 1); });
+    EXPECT_TRUE(contains(log, ERR + "err str = ")) << log;
+    EXPECT_EQ(handle.stmt, nullptr);
+}
+
+TEST_F(Database, ABoundStatementThatCannotBePreparedIsToldLikeAnyThatIsExecuted)
+{
+    open_with_table();
+    const char* const values[] = {"x"};
+    const char* statement = "update disk set absent = ?";
+    std::string log = log_of([&] { EXPECT_EQ(db_exec_bound(&handle, statement, values), 1); });
+    EXPECT_EQ(log, ERR + "err str = no such column: absent\n" + INFO + "sqlite err code = 1\n" +
+                       INFO + "sqlite err = no such column: absent\n");
+    EXPECT_EQ(handle.stmt, nullptr);
 }
 
 TEST_F(Database, OnlyTheLastValueOfTheLastRowIsComparedWithOne)
@@ -352,8 +366,8 @@ TEST_F(Database, AStepThatFailsIsLoggedAndFinalizes)
 {
     open_with_table();
     ASSERT_EQ(db_exec(&handle, "insert into disk values (1, 'a')"), 0);
-    ASSERT_EQ(db_prepare(&handle, "insert into disk values (1, 'b')"), 0);
-    std::string log = log_of([&] { EXPECT_EQ(db_step_done(&handle), 1); });
+    std::string log = log_of(
+        [&] { EXPECT_EQ(db_exec_bound(&handle, "insert into disk values (1, 'b')", {}), 1); });
     EXPECT_EQ(log, ERR + "err str = UNIQUE constraint failed: disk.id\n" + INFO +
                        "sqlite err code = 19\n" + INFO +
                        "sqlite err = UNIQUE constraint failed: disk.id\n");
