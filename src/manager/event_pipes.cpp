@@ -112,9 +112,7 @@ int event_pipes_open(event_pipes* pipes)
         return 1;
     }
     memset(pipes, 0, sizeof(*pipes));
-    if (dir_make_own(RUNTIME_DIR) != 0) {
-        return 1;
-    }
+    const bool have_own_dir = dir_make_own(RUNTIME_DIR) == 0;
 
     struct pipe_place {
         const char* path;
@@ -137,7 +135,8 @@ int event_pipes_open(event_pipes* pipes)
     log_info("fd disk_add_remove = %d\n", pipes->fd_add_remove);
     log_info("fd disk_safe_remove = %d\n", pipes->fd_safe_remove);
     log_info("fd disk_remove = %d\n", pipes->fd_remove);
-    return 0;
+    // A directory that appeared only now is somebody else's, and so may its pipes be.
+    return have_own_dir ? 0 : 1;
 }
 
 int event_pipes_close(event_pipes* pipes)

@@ -278,18 +278,19 @@ int dir_make(const char* path)
 
 int dir_make_own(const char* path)
 {
-    for (int i = 0; i < DIR_MAKE_TRIES; ++i) {
+    path_owner owner = PATH_FOREIGN;
+    for (int i = 0; i < DIR_MAKE_TRIES && owner == PATH_FOREIGN; ++i) {
         if (claim_path(path) != 0) {
             return 1;
         }
         dir_make(path);
         // Making is content with what somebody else made a moment earlier.
-        if (path_get_owner(path) == PATH_OURS) {
-            return 0;
-        }
+        owner = path_get_owner(path);
     }
-    log_err("err, dir = %s\n", path);
-    return 1;
+    if (owner != PATH_OURS) {
+        log_err("err, dir = %s\n", path);
+    }
+    return owner == PATH_OURS ? 0 : 1;
 }
 
 int fifo_create_open(const char* path)

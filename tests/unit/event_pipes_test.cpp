@@ -99,6 +99,17 @@ TEST_F(EventPipes, opening_fails_when_a_pipe_cannot_be_made)
     support::remove_all("/tmp/tarn_nas");
 }
 
+TEST_F(EventPipes, without_its_directory_making_a_pipe_fails_with_the_systems_error)
+{
+    event_pipes_close(&pipes);
+    support::remove_all("/tmp/tarn_nas");
+    support::stub_programs stubs;
+    stubs.add("mkdir");
+    const std::string log = capture_stdout([&] { EXPECT_EQ(event_pipes_open(&pipes), 1); });
+    EXPECT_EQ(stubs.calls().size(), 1U);
+    EXPECT_TRUE(contains(log, "(No such file or directory)mknod err:")) << log;
+}
+
 TEST_F(EventPipes, closing_closes_the_descriptors_and_zeroes_the_record)
 {
     const int fd = pipes.fd_safe_remove;
