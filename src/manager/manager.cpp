@@ -258,6 +258,8 @@ int manager_event_loop(disk_manager* manager)
             manager_idle(manager);
         }
     }
+    // What ended the loop is told before the lines of what follows it.
+    signal_inbox_report();
     return 0;
 }
 

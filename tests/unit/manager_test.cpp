@@ -4,10 +4,12 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <csignal>
 #include <ctime>
 #include <string>
 
 #include "disk/disk_db.h"
+#include "main/signals.h"
 #include "support_disk/disk_world.h"
 #include "util/fs_code.h"
 
@@ -595,4 +597,23 @@ TEST_F(Manager, a_run_scans_once_loops_and_rebuilds_the_manager_once_at_its_end)
     EXPECT_EQ(support::count_of(log, "scan path = /sys/block\n"), 1);
     EXPECT_EQ(support::count_of(log, "EVENT_DISK_HEART_BEAT"), 1);
     EXPECT_EQ(read_file(DISK_JSON_FILE), EMPTY_JSON) << "the status file stays";
+}
+
+TEST_F(Manager, signals_of_the_last_event_are_told_before_the_manager_is_rebuilt)
+{
+    const std::string log = expect_in_child([&] {
+        setup_signals();
+        send("#add:sda\n");
+        the_clock.on_look = [](int look) {
+            // The third look is the event's.
+            if (look == 3) {
+                raise(SIGINT);
+                raise(SIGINT);
+            }
+        };
+        EXPECT_EQ(manager_run(manager), 0);
+    });
+    EXPECT_TRUE(contains(log, "EVENT_DISK_ADD")) << log;
+    EXPECT_TRUE(contains(log, "get sig = SIGINT, c = 1\n")) << log;
+    EXPECT_LT(log.find("get sig = SIGINT, c = 1\n"), log.find("fd disk_add_remove")) << log;
 }
