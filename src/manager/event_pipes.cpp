@@ -1,5 +1,6 @@
 #include "manager/event_pipes.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -16,6 +17,8 @@ namespace {
 
 // What a pipe holds. A writer that never ends its line must not keep the loop for ever.
 constexpr uint32_t PIPE_CAPACITY = 65536;
+
+constexpr int FIFO_TRIES = 3;
 
 struct event_kind {
     event_code code;
@@ -87,6 +90,28 @@ int read_pipe(const event_pipes* pipes, int fd, char* buffer, uint32_t size)
     return 0;
 }
 
+bool is_fifo(int fd)
+{
+    struct stat info {};
+    return fstat(fd, &info) == 0 && S_ISFIFO(info.st_mode);
+}
+
+// A writer that redirects to the name while the pipe is made anew creates a plain file, which would
+// be ready to read for ever.
+int open_fifo(const char* path)
+{
+    for (int i = 0; i < FIFO_TRIES; ++i) {
+        const int fd = fifo_create_open(path);
+        if (fd < 0 || is_fifo(fd)) {
+            return fd;
+        }
+        close(fd);
+        file_delete(path);
+    }
+    log_err("err, pipe = %s\n", path);
+    return -1;
+}
+
 void close_pipe(int32_t fd)
 {
     if (fd > 0) {
@@ -127,7 +152,7 @@ int event_pipes_open(event_pipes* pipes)
         file_delete(place.path);
     }
     for (const pipe_place& place : places) {
-        *place.fd = fifo_create_open(place.path);
+        *place.fd = open_fifo(place.path);
         if (*place.fd < 0) {
             return 1;
         }

@@ -1,11 +1,13 @@
 #include "manager/event_pipes.h"
 
 #include <fcntl.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
 #include <csignal>
 #include <cstring>
@@ -108,6 +110,19 @@ TEST_F(EventPipes, without_its_directory_making_a_pipe_fails_with_the_systems_er
     const std::string log = capture_stdout([&] { EXPECT_EQ(event_pipes_open(&pipes), 1); });
     EXPECT_EQ(stubs.calls().size(), 1U);
     EXPECT_TRUE(contains(log, "(No such file or directory)mknod err:")) << log;
+}
+
+TEST_F(EventPipes, a_plain_file_that_comes_back_is_not_taken_for_a_pipe)
+{
+    event_pipes_close(&pipes);
+    support::remove_all(PIPE_REMOVE);
+    support::write_file(PIPE_REMOVE, "#add:sda\n");
+    // What is mounted on cannot be deleted.
+    ASSERT_EQ(mount(PIPE_REMOVE, PIPE_REMOVE, "none", MS_BIND, nullptr), 0) << strerror(errno);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(event_pipes_open(&pipes), 1); });
+    EXPECT_EQ(umount2(PIPE_REMOVE, MNT_DETACH), 0);
+    EXPECT_LT(pipes.fd_remove, 0);
+    EXPECT_TRUE(contains(log, "]err, pipe = /tmp/tarn_nas/pipe_disk_remove\n")) << log;
 }
 
 TEST_F(EventPipes, closing_closes_the_descriptors_and_zeroes_the_record)
