@@ -4,16 +4,15 @@
 
 #include "disk/mount_table.h"
 #include "log/log.h"
-#include "util/exec.h"
 #include "util/file.h"
 #include "util/fs_code.h"
+#include "util/mount_cmd.h"
 #include "util/paths.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr int32_t NUMBER_CANDIDATES = 16;
-constexpr size_t FORCED_UMOUNT_SIZE = 160;  // holds any path of the mount table whole
 
 static_assert(PART_MOUNT_PATH_SIZE == MOUNT_PATH_SIZE, "a listed path fits the record");
 
@@ -87,18 +86,6 @@ void log_mount(const mount_entry* entry)
 bool node_is_gone(const char* dev_path)
 {
     return !path_exists(dev_path) && (errno == ENOENT || errno == ENOTDIR);
-}
-
-// Anybody who may mount a userspace filesystem chooses names in the mount table.
-void umount_force(const char* target)
-{
-    if (!path_is_shell_safe(target)) {
-        log_warn("umount err, target = %s\n", target);
-        return;
-    }
-    char command[FORCED_UMOUNT_SIZE];
-    text_format(command, sizeof(command), "umount -f %s", target);
-    exec_cmd(command, 1);
 }
 
 }  // namespace
@@ -243,7 +230,7 @@ void umount_all_force()
     mount_table table;
     read_mount_table(&table);
     for (int i = 0; i < table.num; ++i) {
-        umount_force(table.entries[i].dev);
-        umount_force(table.entries[i].path);
+        fs_umount_force(table.entries[i].dev);
+        fs_umount_force(table.entries[i].path);
     }
 }

@@ -1,13 +1,11 @@
 #include "disk/removal.h"
 
-#include <cstddef>
-
 #include "disk/disk_db.h"
 #include "disk/mount_table.h"
 #include "log/log.h"
 #include "util/block_dev.h"
-#include "util/exec.h"
 #include "util/file.h"
+#include "util/mount_cmd.h"
 #include "util/paths.h"
 #include "util/pause.h"
 #include "util/text.h"
@@ -17,17 +15,6 @@ namespace {
 // Someone is about to pull the disks: a look that broke off is repeated.
 constexpr int SYS_BLOCK_WALKS = 3;
 
-void run_umount(const char* target)
-{
-    if (!path_is_shell_safe(target)) {
-        log_warn("umount err, target = %s\n", target);
-        return;
-    }
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "umount %s", target);
-    exec_cmd(command, 1);
-}
-
 void umount_until_gone(const char* dev_path)
 {
     char mounted_at[MOUNT_PATH_SIZE]{};
@@ -35,7 +22,7 @@ void umount_until_gone(const char* dev_path)
         if (get_dev_mount_path(dev_path, mounted_at) != 1) {
             return;
         }
-        run_umount(mounted_at);
+        fs_umount(mounted_at);
         pause_seconds(1);
     }
 }
@@ -69,10 +56,10 @@ void umount_part(const part_info* part)
     char dev_path[DEV_PATH_SIZE];
     path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
     if (part->dev_name[0] != '\0') {
-        run_umount(dev_path);
+        fs_umount(dev_path);
     }
     if (part->mount_path[0] != '\0') {
-        run_umount(part->mount_path);
+        fs_umount(part->mount_path);
     }
     umount_until_gone(dev_path);
     note_unmounted(part->uid);

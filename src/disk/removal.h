@@ -25,5 +25,5 @@ int remove_dev(disk_sets* sets, const char* dev_name);
 // null table.
 int remove_disk(disk_sets* sets, const char* disk_name);
 
-// Unmounts and forgets every disk that the kernel lists. 0, 1 when /sys/block cannot be opened.
+// Unmounts and forgets every disk that the kernel lists. 0, 1 when /sys/block cannot be read.
 int safe_remove_all(disk_sets* sets);

@@ -11,7 +11,7 @@
 
 namespace {
 
-constexpr size_t UMOUNT_ENTRY_SIZE = 256;
+constexpr size_t UMOUNT_SIZE = 256;
 
 struct mount_cmd {
     int32_t fs_type;
@@ -31,10 +31,26 @@ constexpr mount_cmd MOUNT_CMDS[] = {
 
 int run_repair(const char* program, const char* dev_path)
 {
+    if (!path_is_shell_safe(dev_path)) {
+        log_warn("repair err, dev = %s\n", dev_path);
+        return 0;
+    }
     char command[COMMAND_SIZE];
     text_format(command, sizeof(command), "%s %s", program, dev_path);
     exec_cmd(command, 1);
     return 0;
+}
+
+// Anybody who may mount a userspace filesystem chooses names in the mount table.
+void run_umount(const char* program, const char* target)
+{
+    if (!path_is_shell_safe(target)) {
+        log_warn("umount err, target = %s\n", target);
+        return;
+    }
+    char command[UMOUNT_SIZE];
+    text_format(command, sizeof(command), "%s %s", program, target);
+    exec_cmd(command, 1);
 }
 
 }  // namespace
@@ -79,6 +95,16 @@ int fs_repair_fat(const char* dev_path)
     return run_repair("fsck.fat -a", dev_path);
 }
 
+void fs_umount(const char* target)
+{
+    run_umount("umount", target);
+}
+
+void fs_umount_force(const char* target)
+{
+    run_umount("umount -f", target);
+}
+
 int umount_dir_entries(const char* path)
 {
     dir_stream dir(path);
@@ -90,9 +116,9 @@ int umount_dir_entries(const char* path)
         if (name[0] == '.') {
             continue;
         }
-        char command[UMOUNT_ENTRY_SIZE];
-        text_format(command, sizeof(command), "umount %s/%s", path, name);
-        exec_cmd(command, 1);
+        char target[UMOUNT_SIZE];
+        text_format(target, sizeof(target), "%s/%s", path, name);
+        run_umount("umount", target);
     }
     return 0;
 }

@@ -1,4 +1,5 @@
-// The shell commands that mount and repair each kind of filesystem.
+// The shell commands that mount, unmount and repair filesystems. What a shell would not take as one
+// plain word reaches none of them; it is logged.
 #pragma once
 
 #include <cstdint>
@@ -15,6 +16,10 @@ int fs_repair_ext3(const char* dev_path);
 int fs_repair_ext4(const char* dev_path);
 int fs_repair_fat(const char* dev_path);
 
-// Unmounts every entry of a directory whose name does not begin with a dot. 0 after the walk, 1
-// when the directory cannot be opened.
+// Unmount a device node or a directory. Whether it worked shows in the mount table.
+void fs_umount(const char* target);
+void fs_umount_force(const char* target);
+
+// Nothing in the daemon calls it. Unmounts every entry of a directory whose name does not begin
+// with a dot. 0 after the walk, 1 when the directory cannot be opened.
 int umount_dir_entries(const char* path);

@@ -5,6 +5,7 @@
 
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 
 #include "log/log.h"
 #include "util/exec.h"
@@ -14,6 +15,12 @@
 namespace {
 
 constexpr int REMOVE_TRIES = 3;
+
+// Strangers name the entries of a tree, and these characters keep their meaning inside quotes.
+bool is_quotable(const char* path)
+{
+    return strpbrk(path, "\"$`\\") == nullptr;
+}
 
 bool removed_in_tries(const char* path, int (*remove_call)(const char*))
 {
@@ -53,7 +60,7 @@ int path_rm_rf(const char* path)
     if (path == nullptr) {
         return 1;
     }
-    char* command = text_join("rm -rf \"", path, "\"");
+    char* command = is_quotable(path) ? text_join("rm -rf \"", path, "\"") : nullptr;
     const bool done = command != nullptr && exec_cmd(command, 1) == 0;
     free(command);
     if (!done) {
@@ -85,35 +92,35 @@ int link_remove_retry(const char* path)
     return 1;
 }
 
-int path_get_type(const char* path)
+path_type path_get_type(const char* path)
 {
     if (path == nullptr) {
         log_err("err!\n");
-        return -1;
+        return PATH_TYPE_ERROR;
     }
     struct stat info {};
     if (lstat(path, &info) != 0) {
         log_errno("file not exist, file = %s\n", path);
-        return -1;
+        return PATH_TYPE_ERROR;
     }
     if (S_ISDIR(info.st_mode)) {
-        return 1;
+        return PATH_TYPE_DIRECTORY;
     }
     if (S_ISREG(info.st_mode)) {
-        return 2;
+        return PATH_TYPE_FILE;
     }
-    return S_ISLNK(info.st_mode) ? 3 : 0;
+    return S_ISLNK(info.st_mode) ? PATH_TYPE_LINK : PATH_TYPE_OTHER;
 }
 
 int path_remove_tree(const char* path)
 {
     switch (path_get_type(path)) {
-        case 1:
+        case PATH_TYPE_DIRECTORY:
             return remove_directory(path);
-        case 2:
+        case PATH_TYPE_FILE:
             file_remove_retry(path);
             return 0;
-        case 3:
+        case PATH_TYPE_LINK:
             link_remove_retry(path);
             return 0;
         default:

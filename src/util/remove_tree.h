@@ -2,7 +2,7 @@
 // a line says otherwise; every failure is logged where it happens.
 #pragma once
 
-// rm -rf of a path.
+// rm -rf of a path; 1 also for one that a shell would not take as it stands in quotes.
 int path_rm_rf(const char* path);
 
 // Up to 3 tries each without a pause; the first falls back to path_rm_rf.
@@ -10,8 +10,16 @@ int file_remove_retry(const char* path);
 int dir_remove_retry(const char* path);
 int link_remove_retry(const char* path);
 
-// What lies at a path, links not followed: -1 error, 0 other, 1 directory, 2 file, 3 link.
-int path_get_type(const char* path);
+enum path_type {
+    PATH_TYPE_ERROR = -1,
+    PATH_TYPE_OTHER = 0,
+    PATH_TYPE_DIRECTORY = 1,
+    PATH_TYPE_FILE = 2,
+    PATH_TYPE_LINK = 3,
+};
+
+// What lies at a path; a link is not followed.
+path_type path_get_type(const char* path);
 
 // Removes a file, link or directory tree. Entries that begin with a dot are left alone, and so is
 // the directory that holds one. Leaves the working directory in the parent of path.

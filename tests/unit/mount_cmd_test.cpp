@@ -99,9 +99,8 @@ TEST(RepairCommand, EachFamilyRunsItsChecker)
 TEST(RepairCommand, ACommandThatIsKilledIsTriedOnceAndGivesZero)
 {
     support::stub_programs stubs;
-    stubs.add("ntfsfix");
-    support::capture_stderr(
-        [&] { log_of([&] { EXPECT_EQ(fs_repair_ntfs("x; kill -KILL $$"), 0); }); });
+    stubs.add("ntfsfix", "kill -KILL $$");
+    support::capture_stderr([&] { log_of([&] { EXPECT_EQ(fs_repair_ntfs("x"), 0); }); });
     EXPECT_EQ(stubs.calls(), lines{"ntfsfix x"});
 }
 
@@ -114,6 +113,14 @@ TEST(RepairCommand, IsCutAt127Characters)
         log_of([&] { fs_repair_ntfs(path.c_str()); });
         EXPECT_EQ(stubs.calls(), lines{("ntfsfix " + path).substr(0, 127)});
     }
+}
+
+TEST(RepairCommand, OfANameThatAShellWouldReadRunsNothing)
+{
+    const std::string log =
+        log_of([] { EXPECT_EQ(fs_repair_fat("/dev/sda1;touch /run/harm"), 0); });
+    EXPECT_FALSE(contains(log, "exec cmd")) << log;
+    EXPECT_TRUE(contains(log, "repair err, dev = /dev/sda1;touch /run/harm\n")) << log;
 }
 
 class UmountDirEntries : public testing::Test {
@@ -140,6 +147,15 @@ TEST_F(UmountDirEntries, UnmountsEveryEntryThatIsNotHidden)
     std::sort(calls.begin(), calls.end());
     EXPECT_EQ(calls, (lines{"umount /tmp/mountd/disk1_part1", "umount /tmp/mountd/disk2_part1"}));
     EXPECT_TRUE(contains(log, "exec cmd = umount /tmp/mountd/disk1_part1\n")) << log;
+}
+
+TEST_F(UmountDirEntries, NamesThatAShellWouldReadReachNoCommand)
+{
+    support::make_dir(dir + "/$(touch harm)");
+    support::make_dir(dir + "/disk1_part1");
+    std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 0); });
+    EXPECT_EQ(stubs.calls(), lines{"umount /tmp/mountd/disk1_part1"});
+    EXPECT_TRUE(contains(log, "umount err, target = /tmp/mountd/$(touch harm)\n")) << log;
 }
 
 TEST_F(UmountDirEntries, OfAnEmptyDirectoryRunsNothing)

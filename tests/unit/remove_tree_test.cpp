@@ -52,6 +52,18 @@ TEST_F(Remove, RmRfTakesAWholeTreeInDoubleQuotes)
     EXPECT_TRUE(exists(ROOT + "/with"));
 }
 
+TEST_F(Remove, RmRfRefusesWhatAShellReadsInQuotes)
+{
+    for (const char* name : {"$(touch harm)", "`touch harm`", "a\"; touch harm; \"", "a\\"}) {
+        const std::string path = ROOT + "/" + name;
+        write_file(path, "");
+        const std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 1); });
+        EXPECT_EQ(support::count_of(log, "exec cmd"), 0) << log;
+        EXPECT_TRUE(support::contains(log, "rm err, fn = " + path)) << log;
+        EXPECT_TRUE(exists(path));
+    }
+}
+
 TEST_F(Remove, RmRfTakesAPathOfAnyLength)
 {
     std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
