@@ -4,10 +4,12 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "util/paths.h"
+
 // Text sizes, terminating zero included.
 constexpr size_t PART_UID_SIZE = 128;
 constexpr size_t PART_DEV_NAME_SIZE = 16;
-constexpr size_t PART_DISK_NAME_SIZE = 32;
+constexpr size_t PART_DISK_NAME_SIZE = MOUNT_NAME_SIZE;
 constexpr size_t PART_LABEL_SIZE = 128;
 constexpr size_t PART_MOUNT_PATH_SIZE = 128;
 

@@ -88,7 +88,8 @@ bool mount_path_is_usable(const char* path)
         return false;
     }
     const char* name = path + MOUNT_BASE_LENGTH + 1;
-    return name[0] != '\0' && name[0] != '.' && name_is_shell_safe(name);
+    return name[0] != '\0' && name[0] != '.' && strlen(name) < MOUNT_NAME_SIZE &&
+           name_is_shell_safe(name);
 }
 
 bool name_is_shell_safe(const char* name)

@@ -4,9 +4,10 @@
 #include <cstddef>
 #include <cstdint>
 
-constexpr size_t PATH_SIZE = 128;     // buffers for paths below the fixed directories
-constexpr size_t DEV_PATH_SIZE = 64;  // buffers for "/dev/%s" of a record's device name
-constexpr size_t COMMAND_SIZE = 128;  // buffers for shell commands; longer ones are cut
+constexpr size_t PATH_SIZE = 128;       // buffers for paths below the fixed directories
+constexpr size_t DEV_PATH_SIZE = 64;    // buffers for "/dev/%s" of a record's device name
+constexpr size_t COMMAND_SIZE = 128;    // buffers for shell commands; longer ones are cut
+constexpr size_t MOUNT_NAME_SIZE = 32;  // buffers for directory names below the mount base
 
 // What other programs see. The doubled slashes belong to the names.
 inline constexpr char RUNTIME_DIR[] = "/tmp/tarn_nas/";
@@ -62,8 +63,9 @@ void path_mount_dir(char* out, size_t size, const char* mount_name);
 // comparing them, and one slash behind. 0, or 1 for a null argument or a path shorter than that.
 int mount_path_to_name(const char* mount_path, char* out, size_t size);
 
-// True when path is a directory directly below the mount base whose name has only the characters
-// below: what the daemon itself once chose, and not what a damaged database says.
+// True when path is a directory directly below the mount base whose name fits MOUNT_NAME_SIZE and
+// has only the characters below: what the daemon itself once chose, and not what a damaged database
+// says.
 bool mount_path_is_usable(const char* path);
 
 // True when name holds nothing but what kernel device names are made of: letters, digits, and the

@@ -203,3 +203,10 @@ TEST(MountPathIsUsable, RefusesEveryOtherPath)
         EXPECT_FALSE(mount_path_is_usable(path)) << path;
     }
 }
+
+TEST(MountPathIsUsable, TakesNamesThatFitIntoARecord)
+{
+    const std::string name(MOUNT_NAME_SIZE - 1, 'a');
+    EXPECT_TRUE(mount_path_is_usable(("/tmp/mountd/" + name).c_str()));
+    EXPECT_FALSE(mount_path_is_usable(("/tmp/mountd/" + name + "a").c_str()));
+}
