@@ -18,8 +18,8 @@ target_compile_options(diskmanager_warnings INTERFACE
     # Log lines show "src/disk/mount.cpp" wherever the checkout lies.
     "-fmacro-prefix-map=${PROJECT_SOURCE_DIR}/=")
 
-# A disk or database file past 2 GiB must not fail on 32-bit routers.
-target_compile_definitions(diskmanager_warnings INTERFACE _FILE_OFFSET_BITS=64)
+# On 32-bit routers a disk or database file past 2 GiB must not fail, nor the clock in 2038.
+target_compile_definitions(diskmanager_warnings INTERFACE _FILE_OFFSET_BITS=64 _TIME_BITS=64)
 
 if(DISKMANAGER_SANITIZE)
     # The vptr check needs the run-time type information that the product does without.

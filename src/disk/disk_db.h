@@ -2,7 +2,6 @@
 // returns to the same directory after re-plugging and restarts.
 #pragma once
 
-#include <cstddef>
 #include <cstdint>
 
 #include "db_sqlite/db_sqlite.h"

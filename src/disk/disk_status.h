@@ -1,4 +1,4 @@
-// The status files that tell other programs which disks and partitions are usable.
+// The status files that tell other programs of the disks and partitions, mounted or not.
 #pragma once
 
 #include "disk/disk_sets.h"

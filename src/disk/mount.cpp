@@ -1,7 +1,5 @@
 #include "disk/mount.h"
 
-#include <cstddef>
-
 #include "disk/disk_db.h"
 #include "disk/mount_point.h"
 #include "disk/mount_table.h"

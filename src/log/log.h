@@ -32,7 +32,7 @@ void log_enable_syslog();
 // Opens the dated log file of this start. 0 on success, 1 on failure.
 int log_file_open();
 
-// Closes the log file when one is open. Always 0.
+// Closes the log file when one is open, for the last time: no log file call may follow. Always 0.
 int log_file_close();
 
 // Appends text to the log file, opening it when needed. 0 when written; 1 when the file cannot be

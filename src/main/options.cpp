@@ -11,7 +11,10 @@ int32_t block_input_mode = 0;
 
 namespace {
 
+// Also in CMakeLists.txt and in the package's Makefile.
 constexpr char VERSION[] = "1.05";
+
+// Fixed, so that one source always gives the same binary.
 constexpr char BUILD_DATE[] = "Feb 16 2022";
 constexpr char BUILD_TIME[] = "20:29:10";
 

@@ -46,7 +46,7 @@ int manager_free(disk_manager* manager);
 // first takes over what is mounted already. 1 when /sys/block cannot be opened.
 int manager_scan(disk_manager* manager, int32_t mount_known);
 
-// Scan and loop, until the loop is asked to stop. Always 0.
+// Scan and loop, until the loop is asked to stop.
 int manager_run(disk_manager* manager);
 
 // The loop alone: one event or one idle cycle at a time. 0 when running is 0.

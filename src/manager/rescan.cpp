@@ -1,7 +1,6 @@
 #include "manager/rescan.h"
 
 #include <cstddef>
-#include <cstring>
 
 #include "disk/discovery.h"
 #include "disk/removal.h"

@@ -77,6 +77,7 @@ void apply_webdav_rule(uci_context* ctx)
     if (ser_port_set == 1 || webdav_port_set == 1) {
         return;
     }
+    // Nothing fills it; whoever reads the log expects the line.
     const char tarnnas_target[OPTION_SIZE]{};
     char webdav_target[OPTION_SIZE]{};
     if (published_disk_count() > 0) {
