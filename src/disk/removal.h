@@ -21,8 +21,8 @@ int remove_sub_part(disk_sets* sets, const char* dev_name);
 // Either of the two, whichever the name is at the moment. Always 0, 1 for a null table.
 int remove_dev(disk_sets* sets, const char* dev_name);
 
-// Unmounts and forgets the partition mounted in that directory (disk1_part2). Always 0, 1 for a
-// null table.
+// Unmounts and forgets the partition mounted in that directory (disk1_part2); a whole disk's is not
+// looked for. Always 0, 1 for a null table.
 int remove_disk(disk_sets* sets, const char* disk_name);
 
 // Unmounts and forgets every disk that the kernel lists. 0, 1 when /sys/block cannot be read.

@@ -55,7 +55,8 @@ void log_heading(const char* dev_path)
 
 }  // namespace
 
-const char* const fs_type_names[FS_CODE_COUNT] = {
+// As many as the header declares, or it does not compile.
+const char* const fs_type_names[] = {
     "ERR FS",  "ERR FS", "MBR",  "EXT2",     "EXT3",  "FAT",
     "HFSPLUS", "EFI",    "NTFS", "EXTENDED", "EXFAT", "EXT4",
 };
