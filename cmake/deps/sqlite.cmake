@@ -22,8 +22,6 @@ set(sqlite_options
     SQLITE_MAX_MMAP_SIZE=0
     # "/tmp" is memory on a router anyway.
     SQLITE_TEMP_STORE=3
-    # Sleeps between two attempts on a locked file are in milliseconds, not in whole seconds.
-    HAVE_USLEEP=1
     # Saves the writing of the file's times at each commit, which wears the flash.
     HAVE_FDATASYNC=1
     # The statements are the daemon's own: nothing to be checked for depth, and text in double quotes is a mistake.
