@@ -278,7 +278,7 @@ TEST_F(Mount, a_damaged_database_does_not_keep_a_partition_from_its_mount)
     EXPECT_STREQ(part->mount_path, "/tmp/mountd/disk1_part1");
 }
 
-TEST_F(Mount, a_mount_command_longer_than_127_characters_is_cut)
+TEST_F(Mount, the_longest_remembered_name_stands_whole_in_the_command_and_a_longer_one_is_refused)
 {
     put_root(&sets.entries[0], "sda", 4000);
     part_info* part = put_part(&sets.entries[0].disk, 0, "sda1", 4000);
@@ -288,14 +288,20 @@ TEST_F(Mount, a_mount_command_longer_than_127_characters_is_cut)
     text_copy(record.uid, "U-1");
     text_copy(record.dev_name, "sda1");
     text_copy(record.disk_name, "disk1_part1");
-    text_copy(record.mount_path, ("/tmp/mountd/" + std::string(110, 'x')).c_str());
+    const std::string longest = "/tmp/mountd/" + std::string(MOUNT_NAME_SIZE - 1, 'x');
+    text_copy(record.mount_path, longest.c_str());
     disk_db_add(&record);
     support::write_file(support_disk::MOUNT_REFUSES, "");
-    const std::string log = capture_stdout([&] { mount_part(part); });
-    const std::string whole =
-        std::string("mount -t vfat -o rw,uid=1000,gid=1000,iocharset=utf8 /dev/sda1 ") +
-        record.mount_path;
-    EXPECT_TRUE(contains(log, "exec cmd = " + whole.substr(0, 127) + "\n")) << log;
+    const std::string command =
+        "exec cmd = mount -t vfat -o rw,uid=1000,gid=1000,iocharset=utf8 /dev/sda1 ";
+    std::string log = capture_stdout([&] { mount_part(part); });
+    EXPECT_TRUE(contains(log, command + longest + "\n")) << log;
+
+    text_copy(record.mount_path, (longest + "x").c_str());
+    disk_db_update_all(&record);
+    log = capture_stdout([&] { mount_part(part); });
+    EXPECT_TRUE(contains(log, "remembered path err, uid = U-1")) << log;
+    EXPECT_TRUE(contains(log, command + "/tmp/mountd/disk0_part0\n")) << log;
 }
 
 TEST_F(Mount, the_first_pass_sorts_and_numbers_all_disks_and_later_passes_do_not)
