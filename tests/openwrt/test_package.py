@@ -107,6 +107,14 @@ def test_the_sources_of_this_tree_are_copied_without_its_builds(buildroot):
     assert not {"build", ".git", "tests"} & prepared
 
 
+def test_a_change_in_whatever_is_copied_and_built_makes_the_buildroot_prepare_anew(buildroot):
+    watched = buildroot.show(PACKAGE)["FILE_DEPENDS"].split()
+    assert all(os.path.exists(path) for path in watched)
+    buildroot.make("prepare")
+    copied = set(os.listdir(buildroot.top / "stage/build"))
+    assert {os.path.basename(path) for path in watched} == copied - {"LICENSE"}
+
+
 def test_a_tarball_is_unpacked_into_the_build_directory_whatever_its_top_directory(buildroot, tmp_path):
     (tmp_path / "release-of-today/src").mkdir(parents=True)
     (tmp_path / "release-of-today/CMakeLists.txt").touch()

@@ -16,6 +16,7 @@ show-$(1):
 	@echo "CMAKE_OPTIONS $$(subst ",,$$(CMAKE_OPTIONS))"
 	@echo "CONFFILES $(strip $(Package/$(1)/conffiles))"
 	@echo "SOURCE_URL $$(PKG_SOURCE_URL)"
+	@echo "FILE_DEPENDS $$(PKG_FILE_DEPENDS)"
 
 install-$(1):
 	$(call Package/$(1)/install,$(STAGE)/root)
