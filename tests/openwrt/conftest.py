@@ -10,9 +10,9 @@ import pytest
 HERE = Path(__file__).resolve().parent
 sys.path[:0] = [str(HERE), str(HERE.parent)]
 
-from router import PACKAGE, Buildroot, Router  # noqa: E402
-from world import missing  # noqa: E402
-from world.world import PROGRAM  # noqa: E402
+from router import PACKAGE, Buildroot, Router
+from world import missing
+from world.world import PROGRAM
 
 
 def pytest_runtest_setup():
@@ -25,7 +25,8 @@ def pytest_runtest_setup():
 def stand_in(tmp_path_factory):
     """The program that has the daemon's signals, pid file and pipe."""
     program = tmp_path_factory.mktemp("stand_in") / "tarn_nas_diskmanager"
-    subprocess.run(["cc", "-O1", "-static", "-o", program, HERE / "stand_in.c"], check=True)
+    subprocess.run(["cc", "-O1", "-static", "-Wall", "-Wextra", "-Werror", "-o", program,
+                    HERE / "stand_in.c"], check=True)
     return program
 
 

@@ -21,9 +21,9 @@ static const char PIPE[] = "/tmp/tarn_nas/pipe_disk_add_remove";
 
 static volatile sig_atomic_t sigint_count;
 
-static void note(const char *format, ...)
+static void note(const char* format, ...)
 {
-    FILE *notes = fopen("/tmp/notes", "a");
+    FILE* notes = fopen("/tmp/notes", "a");
     va_list args;
     va_start(args, format);
     vfprintf(notes, format, args);
@@ -31,10 +31,10 @@ static void note(const char *format, ...)
     fclose(notes);
 }
 
-static int has_mode(const char *word)
+static int has_mode(const char* word)
 {
     char text[64] = "";
-    FILE *mode = fopen("/tmp/mode", "r");
+    FILE* mode = fopen("/tmp/mode", "r");
     if (mode) {
         if (!fgets(text, sizeof text, mode))
             text[0] = 0;
@@ -52,7 +52,7 @@ static void on_sigint(int number)
 static int another_runs(void)
 {
     char mine[32] = "", all[128] = "";
-    FILE *file = fopen(PID_FILE, "r");
+    FILE* file = fopen(PID_FILE, "r");
     if (!file)
         return 0;
     size_t used = fread(mine, 1, sizeof mine - 1, file);
@@ -92,7 +92,7 @@ int main(void)
     signal(SIGTERM, SIG_IGN);
     signal(SIGINT, on_sigint);
     mkdir("/tmp/tarn_nas", 0755);
-    FILE *file = fopen(PID_FILE, "w");
+    FILE* file = fopen(PID_FILE, "w");
     fprintf(file, "%d", getpid());
     fclose(file);
     unlink(PIPE);

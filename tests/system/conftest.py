@@ -5,10 +5,12 @@ from pathlib import Path
 
 import pytest
 
-sys.path.insert(0, str(Path(__file__).resolve().parents[1]))
+HERE = Path(__file__).resolve().parent
+sys.path[:0] = [str(HERE), str(HERE.parent)]
 
-from world import World, kernel_has, missing  # noqa: E402
-from world.world import PROGRAM  # noqa: E402
+from published import StatusWatch
+from world import World, kernel_has, missing
+from world.world import PROGRAM
 
 _WORLDS = pytest.StashKey[list]()
 
@@ -67,6 +69,16 @@ def make_world(request):
 def world(make_world):
     """A fresh world with the distribution's tools."""
     return make_world()
+
+
+@pytest.fixture
+def watched_status(world):
+    """Holds every status that the daemon publishes in `world` against the schema."""
+    watch = StatusWatch(world)
+    watch.start()
+    yield
+    watch.stop()
+    assert not watch.faults, "\n".join(watch.faults)
 
 
 @pytest.fixture

@@ -4,9 +4,10 @@ import os
 import signal
 
 import pytest
-from published import world  # noqa: F401
 
 from world import PIPES
+
+pytestmark = pytest.mark.usefixtures("watched_status")
 
 EVENTS = {
     "#add:sdx": "EVENT_DISK_ADD",

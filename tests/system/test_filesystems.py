@@ -1,9 +1,11 @@
 """Tables, filesystems and labels, as the distribution's own tools make and read them."""
 
 import pytest
-from published import wait_directories, wait_mounted, world  # noqa: F401
+from published import wait_directories, wait_mounted
 
 from world import Partition
+
+pytestmark = pytest.mark.usefixtures("watched_status")
 
 
 def swap(size_mib, **options):

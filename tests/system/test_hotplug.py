@@ -2,11 +2,11 @@
 
 import pytest
 from moments import quiet_moment
-from published import directories, wait_directories, wait_mounted, world  # noqa: F401
+from published import directories, wait_directories, wait_mounted
 
 from world import Partition
 
-pytestmark = pytest.mark.needs_fs("ext4")
+pytestmark = [pytest.mark.needs_fs("ext4"), pytest.mark.usefixtures("watched_status")]
 
 
 def swap(size_mib, **options):

@@ -3,10 +3,12 @@
 import json
 
 import pytest
-from published import directories, wait_directories, wait_mounted, world  # noqa: F401
+from published import directories, wait_directories, wait_mounted
 
 from world import Partition
 from world.state import DISK_JSON, DISK_NUM
+
+pytestmark = pytest.mark.usefixtures("watched_status")
 
 PART_KEYS = ["dev_name", "disk_name", "fs_type", "uid", "label", "total_len", "free_size"]
 

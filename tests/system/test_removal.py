@@ -2,11 +2,11 @@
 
 import pytest
 from moments import first_rescan_over, quiet_moment
-from published import directories, wait_directories, wait_mounted, world  # noqa: F401
+from published import directories, wait_directories, wait_mounted
 
 from world import Partition
 
-pytestmark = pytest.mark.needs_fs("ext4")
+pytestmark = [pytest.mark.needs_fs("ext4"), pytest.mark.usefixtures("watched_status")]
 
 SERVICES = ["samba4", "nas_samba3", "tarn_nas_sys_dl", "tarn_nas_sys_up"]
 STOPPED = [(name, "stop") for name in SERVICES]
