@@ -11,11 +11,7 @@ from disks import DiskBox
 from vm import Vm, VmError
 
 HERE = Path(__file__).resolve().parent
-
-
-def fail_reason(result):
-    lines = (result.stderr + result.stdout).strip().splitlines()
-    return lines[-1] if lines else f"exit status {result.returncode}"
+UNAVAILABLE = 69
 
 
 @pytest.fixture(scope="session")
@@ -24,10 +20,12 @@ def machine_files():
     if os.geteuid() != 0:
         pytest.skip("the machine's packages are installed as root")
 
-    result = subprocess.run([HERE / "prepare"], capture_output=True, text=True)
+    result = subprocess.run([HERE / "prepare"], stdout=subprocess.PIPE, stderr=subprocess.STDOUT, text=True)
 
+    if result.returncode == UNAVAILABLE:
+        pytest.skip(f"no machine: {result.stdout.splitlines()[-1]}")
     if result.returncode != 0:
-        pytest.skip(f"no machine: qemu, the kernel package or a tool cannot be had ({fail_reason(result)})")
+        pytest.fail(f"prepare ended with {result.returncode}:\n{result.stdout}", pytrace=False)
 
 
 @pytest.fixture
