@@ -117,8 +117,9 @@ class Router:
         self.world.write("/tmp/mode", " ".join(words) + "\n")
 
     def notes(self):
-        """Lines that the stand-in noted."""
-        return self.world.read("/tmp/notes").splitlines() if self.world.exists("/tmp/notes") else []
+        """Lines that the stand-in noted; one that it is still noting is none yet."""
+        text = self.world.read("/tmp/notes") if self.world.exists("/tmp/notes") else ""
+        return text[:text.rfind("\n") + 1].splitlines()
 
     def output(self):
         """What the daemon printed, as procd received it."""
