@@ -56,10 +56,15 @@ def test_directories_planted_under_the_scratch_names_are_moved_aside(world, star
     for name in SCRATCH:
         world.write(f"/tmp/{name}/inside", "x")
         give_away(world, f"/tmp/{name}")
-    world.plug(world.partitioned_disk(Partition("ext4", 1200)), "sda")
+    # With a pid file and a label script all are used but the companion's, which is asked for much later.
+    world.write("/tmp/tarn_nas/disk_manager_pid", "99999")
+    world.label_script("#!/bin/sh\necho 'From the script'\n")
+    world.plug(world.partitioned_disk(Partition("ext4", 1200, "DATA")), "sda")
     start_daemon()
     wait_mounted(world, {"sda1": "disk1_part1"})
-    assert list(world.path("/tmp").glob("foreign-*/entry/inside"))
+    assert world.parts()["sda1"].label == "From the script"
+    assert [name for name in SCRATCH if world.path(f"/tmp/{name}").is_dir()] == ["pid"]
+    assert len(list(world.path("/tmp").glob("foreign-*/entry/inside"))) == len(SCRATCH) - 1
 
 
 @pytest.mark.needs_fs("ext4")

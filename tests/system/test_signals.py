@@ -157,7 +157,9 @@ def test_reader_of_the_output_that_goes_away_neither_ends_the_daemon_nor_makes_i
                           stderr=subprocess.STDOUT)
     text = b""
     while b"no event ..." not in text:
-        text += os.read(process.stdout.fileno(), 65536)
+        piece = os.read(process.stdout.fileno(), 65536)
+        assert piece, f"the daemon has ended: {text.decode(errors='replace')}"
+        text += piece
     process.stdout.close()
     daemon = Daemon(process, "/dev/null")
 
