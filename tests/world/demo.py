@@ -129,7 +129,7 @@ class Story:
             target = self.world.path(f"/tmp/mountd/{home}/file of {short}")
             target.write_bytes(content)
             self.sums[short] = hashlib.sha256(content).hexdigest()
-        self.world.run("sync")
+        self.world.run("sync", "-f", *(f"/tmp/mountd/{home}" for home in self.homes.values()))
         self.tell.check("the files are written", self.files_are_intact(self.homes))
 
     def files_are_intact(self, shorts):

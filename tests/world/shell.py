@@ -1,6 +1,7 @@
 """The demo's shell: a world kept up, and commands to plug and pull its disks."""
 
 import inspect
+import subprocess
 import sys
 
 from .show import Failed, table
@@ -56,7 +57,11 @@ class Shell:
             if words:
                 self._serve(words)
         self.tell.say("stopping the daemon")
-        return 0 if self.daemon.stop() == 0 else 1
+        try:
+            return 0 if self.daemon.stop() == 0 else 1
+        except AssertionError as error:
+            self.tell.say(f"  {error}")
+            return 1
 
     def _read(self, stream):
         if stream.isatty():
@@ -74,7 +79,7 @@ class Shell:
             if not _takes(command, words[1:]):
                 raise UsageError(f"wrong number of words after {words[0]!r}; try help")
             command(*words[1:])
-        except UsageError as error:
+        except (UsageError, AssertionError, subprocess.TimeoutExpired) as error:
             self.tell.say(f"  {error}")
         except Failed:
             self.tell.say("  the log may tell why")
@@ -84,6 +89,8 @@ class Shell:
         if disk.name:
             raise UsageError(f"{short} is plugged already, as {disk.name}")
         name = device or self._free_name(short)
+        if not name.isalnum():
+            raise UsageError(f"{name!r} is no name of a device")
         if name in self.world.sysfs.names():
             raise UsageError(f"{name} is taken")
         self._plugged_at[short] = self.daemon.mark()
