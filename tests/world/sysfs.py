@@ -66,14 +66,6 @@ class Sysfs:
             link.unlink(missing_ok=True)
         shutil.rmtree(self._sys / "devices" / place)
 
-    def set_size(self, name, sectors):
-        """Change what the "size" file of a device says."""
-        self.entry(name, "size").write_text(f"{sectors}\n")
-
-    def entry(self, name, attribute):
-        """The path, seen from outside the world, of one attribute file."""
-        return self._sys / "devices" / self._devices[name][0] / attribute
-
     def names(self):
         """All devices added and not removed."""
         return list(self._devices)

@@ -31,6 +31,7 @@ _HOLD = f'echo {_HELD}; read -r go; exec "$0" "$@" < /dev/null'
 _BOOT = "import json,sys; job=json.loads(sys.stdin.readline()); exec(job['code'])"
 # What a router's kernel lists beside the disks; the daemon must pass over them.
 _OTHER_DEVICES = ("loop0", "mtdblock0", "zram0")
+_WORKDIR = "tarn-world-"
 
 _live = weakref.WeakSet()
 
@@ -39,6 +40,14 @@ _live = weakref.WeakSet()
 def _close_all():
     for world in list(_live):
         world.close()
+
+
+def _remove_leftovers():
+    """Remove the directories of processes that were killed and could not do it themselves."""
+    for folder in Path(tempfile.gettempdir()).glob(f"{_WORKDIR}*-*"):
+        pid = folder.name.removeprefix(_WORKDIR).split("-")[0]
+        if not Path(f"/proc/{pid}").exists():
+            shutil.rmtree(folder, ignore_errors=True)
 
 
 class World(state.Observed):
@@ -56,7 +65,8 @@ class World(state.Observed):
 
     def __init__(self, tools="", program=None, tmp_mib=64, environ=None):
         self.program = Path(program or os.environ.get("TARN_DAEMON") or PROGRAM)
-        self.workdir = Path(tempfile.mkdtemp(prefix="tarn-world-"))
+        _remove_leftovers()
+        self.workdir = Path(tempfile.mkdtemp(prefix=f"{_WORKDIR}{os.getpid()}-"))
         self._disks = []
         self._detaching = []
         self._daemons = []
@@ -218,12 +228,6 @@ class World(state.Observed):
                                  part.device_bytes // disks.SECTOR, disk.loops[name].devno)
         self._make_node(name, disk.loops[name])
 
-    def hide_partition(self, disk, part):
-        """Let one partition of a plugged disk vanish; its loop stays."""
-        name = disk.part_name(part)
-        self.path(f"/dev/{name}").unlink(missing_ok=True)
-        self.sysfs.remove(name)
-
     def pull(self, disk, surprise=True):
         """Let a disk vanish; returns the remove messages a hotplug script would send.
 
@@ -319,23 +323,19 @@ class World(state.Observed):
     def close(self):
         """End all processes, give back every mount and loop.  Safe to call twice.
 
-        Raises WaitTimeout when the kernel keeps a loop attached.
+        What fails keeps nothing else from being given back.  Raises WaitTimeout when the
+        kernel keeps a loop attached.
         """
         _live.discard(self)
-        for process in self._processes:
-            self._kill_group(process)
-        for receiver in self._sockets:
-            receiver.close()
-        self._stop_keeper()
-        for disk in self._disks:
-            for loop in disk.loops.values():
-                loop.release()
-            self._detaching += disk.loops.values()
-            disk.loops = {}
-            disk.close()
-        shutil.rmtree(self.workdir, ignore_errors=True)
-        loops, self._detaching = self._detaching, []
-        self._wait_detached(loops)
+        with contextlib.ExitStack() as last_first:
+            last_first.callback(self._wait_detached)
+            last_first.callback(shutil.rmtree, self.workdir, ignore_errors=True)
+            last_first.callback(self._release_disks)
+            last_first.callback(self._stop_keeper)
+            while self._sockets:
+                last_first.callback(self._sockets.pop().close)
+            while self._processes:
+                last_first.callback(self._kill_group, self._processes.pop())
 
     def _start_keeper(self, tmp_mib):
         visible = [place for place in (CHECKOUT, self.program.parent) if place.is_dir()]
@@ -386,8 +386,17 @@ class World(state.Observed):
             os.killpg(process.pid, 9)
         process.wait(10)
 
-    @staticmethod
-    def _wait_detached(loops):
+    def _release_disks(self):
+        for disk in self._disks:
+            for loop in disk.loops.values():
+                loop.release()
+            self._detaching += disk.loops.values()
+            disk.loops = {}
+            disk.close()
+
+    def _wait_detached(self):
+        loops, self._detaching = self._detaching, []
+
         def still():
             return [loop.path for loop in loops if loop.is_attached()]
         wait_for(lambda: not still(), 10, lambda: f"the kernel to detach {still()}")
