@@ -4,14 +4,20 @@ import contextlib
 import json
 import re
 import sqlite3
-import time
+import tempfile
+from collections import Counter
 from dataclasses import dataclass
 from pathlib import Path
+
+from .waiting import wait_for
 
 DISK_JSON = "/tmp/tarn_nas/disk.json"
 DISK_NUM = "/tmp/tarn_nas/disk_num.txt"
 DISK_DB = "/etc/config/tarn_nas/disk.db"
+DB_JOURNAL = DISK_DB + "-journal"
 PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
+# What the commands of a cycle answered stands in these until it is read.
+SCRATCH = ("/tmp/mount.txt", "/tmp/tmp_blkid", "/tmp/out.txt", "/tmp/disk_uid.txt")
 MOUNT_BASE = "/tmp/mountd"
 
 
@@ -67,21 +73,8 @@ def load_json(text):
         return None
 
 
-def open_db(content):
-    """A connection on a copy of a database file's bytes.
-
-    SQLite resolves every link of a path by itself, /proc/PID/root included, and
-    would open the machine's own file; so the bytes are read here instead.
-    """
-    connection = sqlite3.connect(":memory:")
-    if content:
-        connection.deserialize(content)
-    connection.row_factory = sqlite3.Row
-    return connection
-
-
 class Observed:
-    """What can be seen of a world.  The heir has `keeper_pid` and the file
+    """What can be seen of a world.  The heir has `keeper_pid`, `workdir` and the file
     operations `path`, `read` and `exists`."""
 
     def mounts(self, under=MOUNT_BASE):
@@ -107,30 +100,71 @@ class Observed:
         """Text of the count file, None when there is none."""
         return self.read(DISK_NUM) if self.exists(DISK_NUM) else None
 
-    def db_rows(self):
-        """Rows of the table "disk" as dicts in stored order; [] without a database.
+    @contextlib.contextmanager
+    def db_copy(self):
+        """A connection on a copy of the database as it is now, an empty one without a file.
 
-        Raises sqlite3.DatabaseError for a file that stays unreadable for 2 s.
+        A copy, since SQLite resolves every link of a path by itself, /proc/PID/root
+        included, and since opening a cut-off transaction rolls it back, which is the
+        daemon's to do.  The journal goes with the file: only the two together are the
+        database.
         """
-        for _ in range(40):
-            # The bytes may be read in the middle of one of the daemon's writes.
-            with contextlib.suppress(sqlite3.DatabaseError):
-                return self._db_rows_now()
-            time.sleep(0.05)
-        return self._db_rows_now()
+        with tempfile.TemporaryDirectory(prefix="db-", dir=self.workdir) as folder:
+            copy = Path(folder, "disk.db")
+            for path, content in zip((copy, Path(f"{copy}-journal")), self._db_files()):
+                if content is not None:
+                    path.write_bytes(content)
+            with contextlib.closing(sqlite3.connect(copy)) as connection:
+                connection.row_factory = sqlite3.Row
+                yield connection
 
-    def _db_rows_now(self):
-        if not self.exists(DISK_DB):
-            return []
-        with contextlib.closing(open_db(self.path(DISK_DB).read_bytes())) as database:
-            return [dict(row) for row in database.execute("select * from disk")]
+    def db_rows(self):
+        """Rows of the table "disk" as dicts in stored order; [] without file or table.
+
+        Raises sqlite3.DatabaseError for a file that is no sound database.
+        """
+        with self.db_copy() as database:
+            return [dict(row) for row in _rows(database)]
+
+    def db_fault(self):
+        """What is wrong with the database, as a text; empty when nothing is."""
+        with self.db_copy() as database:
+            verdict = [row[0] for row in database.execute("pragma integrity_check")]
+            if verdict != ["ok"]:
+                return f"integrity_check: {verdict}"
+            uids = Counter(row["uid"] for row in _rows(database))
+        twice = [uid for uid, times in uids.items() if times > 1]
+        return f"rows of {twice} more than once" if twice else ""
 
     def db_execute(self, statement, values=()):
         """Change the database file; the daemon must not be at it meanwhile."""
         target = self.path(DISK_DB)
         target.parent.mkdir(parents=True, exist_ok=True)
-        content = target.read_bytes() if target.exists() else b""
-        with contextlib.closing(open_db(content)) as database:
+        with self.db_copy() as database:
             with database:
                 database.execute(statement, values)
             target.write_bytes(database.serialize())
+
+    def _db_files(self):
+        """The bytes of file and journal, None for one that is not there.
+
+        While the daemon writes, only what two looks in a row find belongs together.
+        """
+        def look():
+            first, second = ([_content(self.path(path)) for path in (DISK_DB, DB_JOURNAL)]
+                             for _ in range(2))
+            return first if first == second else None
+        return wait_for(look, 10, f"{DISK_DB} to rest", 0.01)
+
+
+def _content(path):
+    try:
+        return path.read_bytes()
+    except FileNotFoundError:
+        return None
+
+
+def _rows(database):
+    """All rows; none while the table is not made yet."""
+    made = database.execute("select 1 from sqlite_master where name='disk'").fetchall()
+    return database.execute("select * from disk").fetchall() if made else []
