@@ -5,14 +5,14 @@ from collections import Counter
 from pathlib import Path
 
 HERE = Path(__file__).resolve().parent
-sys.path[:0] = [str(HERE), str(HERE.parent)]
+sys.path[:0] = [str(HERE), str(HERE.parent), str(HERE.parent / "system")]
 
-import pytest  # noqa: E402
+import pytest
 
-import preload  # noqa: E402
-from rig import Rig  # noqa: E402
-from system.conftest import (  # noqa: E402, F401
-    daemon, make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
+import preload
+from rig import Rig
+from system.conftest import (  # noqa: F401
+    make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
     pytest_runtest_setup, start_daemon, world)
 
 _INJECTED = "injected"

@@ -1,6 +1,5 @@
 """Fixtures of the runs under valgrind: the system tests' world, and valgrind's command line."""
 
-import importlib.util
 import shutil
 import sys
 from pathlib import Path
@@ -8,19 +7,12 @@ from pathlib import Path
 import pytest
 
 CHECKOUT = Path(__file__).resolve().parents[2]
-SYSTEM = CHECKOUT / "tests/system"
 DEBUG = CHECKOUT / "build/debug"
-sys.path[:0] = [str(SYSTEM), str(CHECKOUT / "tests")]
+sys.path[:0] = [str(CHECKOUT / "tests"), str(CHECKOUT / "tests/system")]
 
-# The folder of the system tests has a file of this one's name.
-_spec = importlib.util.spec_from_file_location("system_conftest", SYSTEM / "conftest.py")
-_system = importlib.util.module_from_spec(_spec)
-_spec.loader.exec_module(_system)
-pytest_configure = _system.pytest_configure
-pytest_report_header = _system.pytest_report_header
-pytest_runtest_setup = _system.pytest_runtest_setup
-pytest_runtest_makereport = _system.pytest_runtest_makereport
-make_world = _system.make_world
+from system.conftest import (  # noqa: F401
+    make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
+    pytest_runtest_setup)
 
 # What is still reachable at the end is static data of libraries, which they never give back.
 _OPTIONS = ["--error-exitcode=9", "--leak-check=full", "--vgdb=no",

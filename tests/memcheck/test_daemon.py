@@ -4,6 +4,7 @@ import re
 import signal
 
 import pytest
+from moments import quiet_moment
 
 from world import Partition
 
@@ -25,13 +26,6 @@ def world(make_world, valgrind, debug_program, tmp_path):
     made = make_world(program=program)
     made.run("mkdir", LOGS)
     return made
-
-
-def end_of_cycle(world, daemon):
-    """Wait until everything that was sent is done."""
-    mark = daemon.mark()
-    world.send(f"#heart_beat:{mark}", pipe="remove", timeout=60)
-    daemon.wait_log(f"get event = #heart_beat:{mark}", 120, since=mark)
 
 
 def wait_mounted(world, *names):
@@ -61,14 +55,14 @@ def test_a_whole_life_loses_no_byte_and_no_descriptor(world):
     world.send(NO_EVENT)
     wait_mounted(world, "sda1", "sda2", "sdb")
     daemon.wait_rescan(120)
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     world.send("#remove_disk:disk1_part2", pipe="remove")
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     wait_mounted(world, "sda1", "sdb")
     world.send("#nonsense", "junk", "#add:sdx", "#add:" + "x" * 60, "#remove_dev:sdx", "x" * 400)
     world.hotunplug(disk)
     wait_mounted(world, "sdb")
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     world.safe_remove()
     daemon.wait_log("disk safe remove ...", 120)
     wait_mounted(world)

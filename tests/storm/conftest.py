@@ -1,32 +1,16 @@
 """Fixtures of the storm tests: those of the system tests, a long form, and printed figures."""
 
-import importlib.util
 import sys
 from pathlib import Path
 
 import pytest
 
 HERE = Path(__file__).resolve().parent
-SYSTEM = HERE.parent / "system"
-sys.path[:0] = [str(SYSTEM), str(HERE.parent)]
+sys.path[:0] = [str(HERE.parent), str(HERE.parent / "system")]
 
-
-def _load(name, path):
-    spec = importlib.util.spec_from_file_location(name, path)
-    module = importlib.util.module_from_spec(spec)
-    spec.loader.exec_module(module)
-    return module
-
-
-# The folder of the system tests has a file of this one's name.
-_system = _load("system_conftest", SYSTEM / "conftest.py")
-pytest_configure = _system.pytest_configure
-pytest_report_header = _system.pytest_report_header
-pytest_runtest_setup = _system.pytest_runtest_setup
-pytest_runtest_makereport = _system.pytest_runtest_makereport
-make_world = _system.make_world
-world = _system.world
-start_daemon = _system.start_daemon
+from system.conftest import (  # noqa: F401
+    make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
+    pytest_runtest_setup)
 
 
 def pytest_addoption(parser):

@@ -4,6 +4,7 @@ import subprocess
 import sys
 
 import pytest
+from moments import quiet_moment
 
 from world import Partition
 from world.state import DISK_DB
@@ -22,16 +23,6 @@ print("locked", flush=True)
 sys.stdin.read()
 database.execute("rollback")
 """
-
-
-def end_of_cycle(world, daemon):
-    """Wait until the running cycle is over, the self-check that ends a rescan included.
-
-    A node that goes between a rescan and its check is a failed check.
-    """
-    mark = daemon.mark()
-    world.send("#heart_beat")
-    daemon.wait_log("EVENT_DISK_HEART_BEAT", 60, since=mark)
 
 
 def uid_of(world, device):
@@ -82,7 +73,7 @@ def test_damaged_database_stops_no_mount_and_no_removal(world, start_daemon, dam
     assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1",
                                "/dev/sdb1": "/tmp/mountd/disk2_part1"}
     daemon.wait_rescan()
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     world.hotunplug(hot)
     world.wait(lambda: set(world.parts()) == {"sda"}, 30, "sdb1 gone from disk.json")
     assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}

@@ -3,6 +3,7 @@
 from pathlib import Path
 
 import pytest
+from moments import quiet_moment
 
 from world import Partition
 
@@ -20,20 +21,13 @@ COMPACT_HEAP = {"GLIBC_TUNABLES": ":".join(f"glibc.malloc.{setting}" for setting
     "tcache_count=0", "mxfast=0", "trim_threshold=1", "top_pad=0"))}
 
 
-def end_of_cycle(world, daemon):
-    """Wait until everything that was sent is done and no command runs."""
-    mark = daemon.mark()
-    world.send(f"#heart_beat:{mark}")
-    daemon.wait_log(f"get event = #heart_beat:{mark}", 60, since=mark)
-
-
 def mounted_round(world, daemon, disk, number):
     world.hotplug(disk, "sda")
     world.send(NO_EVENT)
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
     world.hotunplug(disk, surprise=number % 20 == 0)
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     assert world.mounted() == {}
 
 
@@ -41,7 +35,7 @@ def announced_round(world, daemon, disk):
     world.plug(disk, "sda")
     world.announce(disk)
     world.send("#remove_dev:sda1", "#remove_dev:sda")
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     world.pull(disk, surprise=False)
 
 
@@ -89,7 +83,7 @@ def send_all_kinds(world, daemon, count):
     for number in range(count):
         world.send(kinds[number % len(kinds)])
         if number % 100 == 99:
-            end_of_cycle(world, daemon)
+            quiet_moment(world, daemon)
 
 
 def test_a_thousand_messages_of_every_kind_leak_no_descriptor_or_byte(world, start_daemon):

@@ -4,6 +4,7 @@ import signal
 import subprocess
 
 import pytest
+from moments import quiet_moment
 
 from world import Partition
 from world.state import DISK_JSON
@@ -12,16 +13,6 @@ LOOKS = 9
 FURTHER_UMOUNTS = 10
 CALLS = "/run/world/mount-calls.txt"
 FILLER = "/tmp/filler"
-
-
-def end_of_cycle(world, daemon):
-    """Wait until the running cycle is over, the self-check that ends a rescan included.
-
-    A node that goes between a rescan and its check is a failed check.
-    """
-    mark = daemon.mark()
-    world.send("#heart_beat")
-    daemon.wait_log("EVENT_DISK_HEART_BEAT", 60, since=mark)
 
 
 def stub_mount(world, pattern, failures):
@@ -185,7 +176,7 @@ def test_full_tmp_loses_nothing_and_the_status_files_are_valid_again_once_there_
     daemon = world.start_daemon()
     world.wait(lambda: len(world.parts()) == 2, 30, "two partitions in disk.json")
     daemon.wait_rescan()
-    end_of_cycle(world, daemon)
+    quiet_moment(world, daemon)
     paths = world.mounted()
     world.sh(f"echo kept > {paths['/dev/sda1']}/file")
 
