@@ -1,24 +1,20 @@
 """Thousands of events of all kinds, and nothing grows."""
 
-import os
 import random
 import re
 import time
 from collections import Counter
-from pathlib import Path
 
 import pytest
 from footprint import Footprint
+from moments import quiet_moment
 from stormy_router import SCRATCH
 
-from world import CHECKOUT, Partition
-from world.world import PROGRAM
+from world import Partition
+from world.built import RELEASE, STATIC, why_not
 
 pytestmark = pytest.mark.needs_fs("ext4")
 
-RELEASE = Path(os.environ.get("TARN_DAEMON") or PROGRAM)
-STATIC = Path(os.environ.get("TARN_DAEMON_STATIC")
-              or CHECKOUT / "build/cross/x86_64/tarn_nas_diskmanager")
 RELEASE_WORLDS, STATIC_WORLDS = 6, 2
 # For each world; the six of the release binary have 10,000 in the long form.
 EVENTS = {"short": 110, "long": 1700}
@@ -61,20 +57,13 @@ class Rounds:
 
     def _run(self, one):
         one(f"sd{self.random.choice('abcd')}")
-        self.end_of_cycle()
+        quiet_moment(self.world, self.daemon)
         assert self.world.mounts() == []
-
-    def end_of_cycle(self):
-        """Wait until everything that was sent is done and no command runs."""
-        mark = self.daemon.mark()
-        # Of this pipe the messages are taken last.
-        self.world.send(f"#heart_beat:{mark}", pipe="remove")
-        self.daemon.wait_log(f"get event = #heart_beat:{mark}", 90, since=mark)
 
     def _mount(self, disk, name):
         self.world.hotplug(disk, name)
         self.world.send(NO_EVENT)
-        self.end_of_cycle()
+        quiet_moment(self.world, self.daemon)
         assert len(self.world.mounts()) == 1
 
     def _mounted(self, name):
@@ -82,25 +71,25 @@ class Rounds:
         if self.random.random() < 0.5:
             directory = self.world.mounts()[0].path.rsplit("/", 1)[1]
             self.world.send(f"#remove_disk:{directory}", pipe="remove")
-            self.end_of_cycle()
+            quiet_moment(self.world, self.daemon)
         self.world.hotunplug(self._disk, surprise=self.random.random() < 0.1)
 
     def _safely_removed(self, name):
         self._mount(self._stick, name)
         self.world.safe_remove()
-        self.end_of_cycle()
+        quiet_moment(self.world, self.daemon)
         self.world.pull(self._stick, surprise=False)
 
     def _announced(self, name):
         self.world.hotplug(self._disk, name)
         self.world.send(f"#remove_dev:{name}1", f"#remove_dev:{name}")
-        self.end_of_cycle()
+        quiet_moment(self.world, self.daemon)
         self.world.pull(self._disk, surprise=False)
 
     def _announced_stick(self, name):
         self.world.hotplug(self._stick, name)
         self.world.send(f"#remove_dev:{name}", "#remove_disk:disk9_part9")
-        self.end_of_cycle()
+        quiet_moment(self.world, self.daemon)
         self.world.pull(self._stick, surprise=False)
 
     def _unknown(self, name):
@@ -124,8 +113,8 @@ def leftovers(world):
 @pytest.mark.parametrize(("program", "number"), PROGRAMS)
 def test_neither_memory_nor_descriptors_grow_with_the_events(
         make_world, request, is_long, figure, program, number):
-    if not program.exists():
-        pytest.skip(f"{program} is not built (scripts/cross x86_64 makes the static one)")
+    if reason := why_not(program):
+        pytest.skip(reason)
     seed = request.config.getoption("--seed") or 40_000 + number
     figure("seed", seed)
     world = make_world(program=program)

@@ -11,13 +11,14 @@ A world owns everything it makes.  When its process ends, however it ends, the
 kernel takes the namespaces, the mounts and the loop devices back.
 """
 
+from .built import CHECKOUT
 from .daemon import Daemon, DaemonGone
 from .disk import Disk, Partition
 from .events import PIPES, add_messages, remove_messages
 from .need import kernel_has, missing
 from .state import Mount, StatusPart
 from .waiting import WaitTimeout, wait_for
-from .world import CHECKOUT, World
+from .world import World
 
 __all__ = [
     "CHECKOUT", "Daemon", "DaemonGone", "Disk", "Mount", "PIPES", "Partition",

@@ -1,8 +1,23 @@
-"""Whether a program that nothing rebuilds by itself is still that of the sources."""
+"""The daemon's binaries, and whether one that nothing rebuilds is still that of the sources."""
 
+import os
 from pathlib import Path
 
 CHECKOUT = Path(__file__).resolve().parents[2]
+PROGRAM = CHECKOUT / "build/release/tarn_nas_diskmanager"
+RELEASE = Path(os.environ.get("TARN_DAEMON") or PROGRAM)
+_BUILT_STATIC = CHECKOUT / "build/cross/x86_64/tarn_nas_diskmanager"
+STATIC = Path(os.environ.get("TARN_DAEMON_STATIC") or _BUILT_STATIC)
+
+
+def why_not(program):
+    """Why one of the two is not to be tested, as a text; empty when it is."""
+    if not program.exists():
+        return f"{program} is not built (scripts/cross x86_64 makes the static one)"
+    # scripts/test does not build it; elsewhere its age says nothing.
+    if program == _BUILT_STATIC and (source := outdated(program)):
+        return f"{program} is older than {source} (scripts/cross x86_64 makes it anew)"
+    return ""
 
 
 def outdated(program, checkout=CHECKOUT):

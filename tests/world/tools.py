@@ -10,13 +10,14 @@ import shutil
 import subprocess
 from pathlib import Path
 
+from .built import CHECKOUT
+
 STUB_DIR = "/run/world/bin"
 APPLET_DIR = "/run/world/applets"
 COMMAND_LOG = "/run/world/commands.log"
 SERVICE_LOG = "/run/world/services.log"
 LABEL_SCRIPT = "/usr/bin/disk_get_label.sh"
 SYSTEM_PATH = "/usr/sbin:/usr/bin:/sbin:/bin"
-CHECKOUT = Path(__file__).resolve().parents[2]
 BUSYBOX = CHECKOUT / "build/busybox/busybox"
 SERVICES = ("samba4", "nas_samba3", "tarn_nas_sys_dl", "tarn_nas_sys_up",
             "tarn_nas_diskmanager", "firewall")

@@ -14,6 +14,7 @@ from pathlib import Path
 
 from . import disk as disks
 from . import state
+from .built import CHECKOUT, PROGRAM
 from .daemon import Daemon, child_of
 from .events import PIPES, add_messages, remove_messages, write_pipe
 from .sysfs import Sysfs
@@ -21,8 +22,6 @@ from .syslog import Syslog
 from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools, make_busybox
 from .waiting import wait_for
 
-CHECKOUT = Path(__file__).resolve().parents[2]
-PROGRAM = CHECKOUT / "build/release/tarn_nas_diskmanager"
 HOTPLUG_HOOK = "/etc/hotplug.d/block/10-mount"
 _NAMESPACES = ["--mount", "--pid", "--ipc", "--uts"]
 # A shell that turns into the program once it is let go, with the same process id.
