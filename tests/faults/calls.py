@@ -37,9 +37,6 @@ class Call:
         return self.names[0]
 
 
-# What commands answered stands in these.
-SCRATCH = ("/tmp/mount.txt", "/tmp/tmp_blkid", "/tmp/out.txt", "/tmp/disk_uid.txt")
-
 CALLS = (
     Call(("openat", "open"), ("EMFILE", "ENOMEM", "EACCES", "EIO", "ENOSPC", "EINTR"), hides=True),
     Call(("read",), ("EIO", "EAGAIN", "EINTR"), hides=True),

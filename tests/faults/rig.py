@@ -1,21 +1,18 @@
 """Two disks and a daemon on which faults are tried, and what must be right again afterwards."""
 
-import sqlite3
 import time
-from contextlib import closing
 from pathlib import Path
 
+from moments import quiet_moment
 from preload import HASTE
 
 from world import DaemonGone, Partition, WaitTimeout, add_messages
-from world.state import DISK_DB
 
-HEART_BEAT = "===> get event = EVENT_DISK_HEART_BEAT"
+SAFELY_REMOVED = "disk safe remove ..."
 BOUND = 90
 RECOVERY = 45
 # A rescan comes in the first cycle that ends 8 s or more after the last.
 WINDOW = (8 + 3 + 2 + 1) / HASTE
-AFTER_SAFE_REMOVAL = 0.7
 
 
 class Rig:
@@ -55,9 +52,11 @@ class Rig:
         # Nothing was said of the other disk.
         assert self.world.mounted().get("/dev/sda1") == self.paths()["/dev/sda1"]
 
-    def safe_removal(self):
+    def safe_removal(self, timeout=BOUND):
+        """Returns when all is unmounted and the daemon waits for the disks to be taken."""
+        mark = self.daemon.mark()
         self.world.safe_remove()
-        time.sleep(AFTER_SAFE_REMOVAL)
+        self.daemon.wait_log(SAFELY_REMOVED, timeout, mark)
 
     def replug(self, by_hand=True):
         """The disks go and come again, as far as the daemon is told.
@@ -77,9 +76,7 @@ class Rig:
 
     def answer(self):
         """Wait until the daemon has read all that was sent: it does not hang."""
-        mark = self.daemon.mark()
-        self.world.send("#heart_beat")
-        self.daemon.wait_log(HEART_BEAT, BOUND, mark)
+        quiet_moment(self.world, self.daemon)
 
     # What must hold.
 
@@ -118,7 +115,7 @@ class Rig:
             return "disk.json lacks the free space"
         if self.world.mounted() != self.paths():
             return f"{self.world.mounted()} is mounted, not {self.paths()}"
-        return database_fault(self.world) or (self._wrong_rows() if rows else "")
+        return self.world.db_fault() or (self._wrong_rows() if rows else "")
 
     def paths(self):
         """{device path: mount path} as it must be."""
@@ -137,25 +134,3 @@ class Rig:
             if (rows[uid]["disk_name"], rows[uid]["mountd"]) != (directory, "yes"):
                 return f"row of {name}: {rows[uid]}"
         return ""
-
-
-def database_fault(world):
-    """What is wrong with the database file as it is now, as a text; empty when nothing is.
-
-    A journal that a fault left behind is SQLite's to play back, so it is read with it.
-    """
-    if not world.exists(DISK_DB) or not world.path(DISK_DB).stat().st_size:
-        return ""
-    copy = Path(world.workdir) / "copy.db"
-    for suffix in ("", "-journal"):
-        target = Path(f"{copy}{suffix}")
-        target.unlink(missing_ok=True)
-        if world.exists(DISK_DB + suffix):
-            target.write_bytes(world.path(DISK_DB + suffix).read_bytes())
-    with closing(sqlite3.connect(copy)) as database:
-        verdict = [row[0] for row in database.execute("pragma integrity_check")]
-        if verdict != ["ok"]:
-            return f"integrity_check: {verdict}"
-        twice = database.execute(
-            "select uid from disk group by uid having count(*) > 1").fetchall()
-        return f"rows of {twice} more than once" if twice else ""

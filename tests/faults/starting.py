@@ -4,7 +4,6 @@ import contextlib
 from collections import Counter
 
 from calls import names_in
-from rig import database_fault
 from strace import Strace
 
 from world import Partition, WaitTimeout
@@ -66,7 +65,7 @@ class Starts:
         assert ended or not call.vital
         if ended:
             daemon = self.start_after(daemon)
-        fault = database_fault(self.world)
+        fault = self.world.db_fault()
         assert not fault, fault
         self._end(daemon)
         return strace.injected
