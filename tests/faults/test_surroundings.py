@@ -212,5 +212,18 @@ def test_sys_block_that_cannot_be_opened_at_start_leaves_the_disks_to_their_anno
     assert world.mounted() == {}
     # Nothing is looked for before the first disk is known.
     world.announce(starts.disk)
-    world.wait(starts.is_right, 10, "the announced disk")
+    world.wait(starts.is_right, 30, "the announced disk")
+    assert daemon.stop() == 0
+
+
+def test_list_of_disks_that_breaks_off_at_start_is_looked_at_again_without_an_announcement(starts):
+    world = starts.world
+    daemon = world.start_daemon(environ=starts.environ, held=True)
+    with Strace(daemon, ["getdents64"], "error=EIO:when=1", paths=["/sys/block"]) as strace:
+        daemon.release()
+        daemon.wait_log("read dir err")
+        daemon.wait_started()
+    assert strace.injected == 1
+    assert "d_name = sda" not in daemon.log()[:daemon.log().index("have disk = ")]
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert daemon.stop() == 0
