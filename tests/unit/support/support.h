@@ -141,8 +141,12 @@ inline std::string log_of(const std::function<void()>& action)
     return without_line_numbers(capture_stdout(action));
 }
 
+// What in_child returns when an expectation failed in the child.
+inline constexpr int expectation_failed = 111;
+
 // Runs action in a process of its own, for what a process cannot take back, and returns its result
-// (0 to 127). 255 when it was killed, also because it took longer than half a minute.
+// (0 to 110). 255 when it was killed, also because it took longer than half a minute. An
+// expectation that fails in it fails the test.
 inline int in_child(const std::function<int()>& action)
 {
     fflush(nullptr);
@@ -151,11 +155,13 @@ inline int in_child(const std::function<int()>& action)
         alarm(30);
         int result = action();
         fflush(nullptr);
-        _exit(result);
+        _exit(testing::Test::HasFailure() ? expectation_failed : result);
     }
     int status = 0;
     EXPECT_EQ(waitpid(child, &status, 0), child);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 255;
+    const int result = WIFEXITED(status) ? WEXITSTATUS(status) : 255;
+    EXPECT_NE(result, expectation_failed);
+    return result;
 }
 
 // Programs in front of PATH that stand in for the system's and write down how they are called.

@@ -5,17 +5,17 @@
 #include <gtest/gtest.h>
 #include <sys/mman.h>
 #include <sys/resource.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstdio>
 #include <functional>
 #include <string>
+
+#include "support/support.h"
 
 namespace support_disk {
 
 struct child_result {
-    int exit_code;  // -1 when a signal ended it
+    int exit_code;
     std::string out;
     std::string err;
 };
@@ -28,28 +28,18 @@ inline std::string read_memfd(int fd)
     return text;
 }
 
-// The action's result is the exit code, unless an expectation in it failed: that gives 111.
+// in_child with what the child wrote kept apart. The exit code is what in_child returns.
 inline child_result run_in_child(const std::function<int()>& action)
 {
-    constexpr int expectation_failed = 111;
     int out = memfd_create("out", MFD_CLOEXEC);
     int err = memfd_create("err", MFD_CLOEXEC);
-    fflush(stdout);
-    fflush(stderr);
-    pid_t pid = fork();
-    if (pid == 0) {
+    const int exit_code = support::in_child([&] {
         dup2(out, STDOUT_FILENO);
         dup2(err, STDERR_FILENO);
-        int code = action();
-        fflush(stdout);
-        fflush(stderr);
-        _exit(testing::Test::HasFailure() ? expectation_failed : code);
-    }
-    int status = 0;
-    EXPECT_EQ(waitpid(pid, &status, 0), pid);
-    child_result result{WIFEXITED(status) ? WEXITSTATUS(status) : -1, read_memfd(out),
-                        read_memfd(err)};
-    EXPECT_NE(result.exit_code, expectation_failed) << result.out;
+        return action();
+    });
+    child_result result{exit_code, read_memfd(out), read_memfd(err)};
+    EXPECT_NE(exit_code, support::expectation_failed) << result.out;
     return result;
 }
 
