@@ -7,15 +7,11 @@ import os
 from pathlib import Path
 
 import pytest
+from moments import quiet_moment
 
 from world import Partition, kernel_has
-from world.built import outdated
+from world.built import RELEASE, STATIC, outdated, why_not
 from world.state import PID_FILE
-from world.world import CHECKOUT, PROGRAM
-
-BUILT_STATIC = CHECKOUT / "build/cross/x86_64/tarn_nas_diskmanager"
-STATIC = Path(os.environ.get("TARN_DAEMON_STATIC") or BUILT_STATIC)
-RELEASE = Path(os.environ.get("TARN_DAEMON") or PROGRAM)
 
 pytestmark = pytest.mark.needs_fs("ext4")
 
@@ -23,20 +19,9 @@ pytestmark = pytest.mark.needs_fs("ext4")
 @pytest.fixture(params=[RELEASE, STATIC], ids=["release", "static"])
 def router(request, make_world):
     """A world with busybox whose daemon is one of the two."""
-    if not request.param.exists():
-        pytest.skip(f"{request.param} is not built (scripts/cross x86_64 makes the static one)")
-    # scripts/test does not build it; elsewhere its age says nothing.
-    source = request.param == BUILT_STATIC and outdated(BUILT_STATIC)
-    if source:
-        pytest.skip(f"{BUILT_STATIC} is older than {source} (scripts/cross x86_64 makes it anew)")
+    if reason := why_not(request.param):
+        pytest.skip(reason)
     return make_world(tools="busybox", program=request.param)
-
-
-def end_of_cycle(world, daemon):
-    """Wait until the running cycle is over, the self-check that ends a rescan included."""
-    mark = daemon.mark()
-    world.send("#heart_beat")
-    daemon.wait_log("EVENT_DISK_HEART_BEAT", 60, since=mark)
 
 
 def test_the_tools_are_busybox(router):
@@ -86,7 +71,7 @@ def test_hot_plugged_disk_comes_goes_and_returns_to_its_directory(router):
     router.hotplug(other, "sdb")
     daemon.wait_log("mount OK, /dev/sdb1 ==> /tmp/mountd/disk2_part1")
     daemon.wait_rescan()
-    end_of_cycle(router, daemon)
+    quiet_moment(router, daemon)
 
     router.hotunplug(first)
     router.hotunplug(other)
