@@ -29,28 +29,29 @@ constexpr mount_cmd MOUNT_CMDS[] = {
     {FS_NTFS, "mount.ntfs-3g -o noatime,big_writes,async,force %s %s"},
 };
 
-int run_repair(const char* program, const char* dev_path)
+int run_repair(const char* format, const char* dev_path)
 {
     if (!path_is_shell_safe(dev_path)) {
         log_warn("repair err, dev = %s\n", dev_path);
         return 0;
     }
     char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "%s %s", program, dev_path);
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wformat-nonliteral"
+    text_format(command, sizeof(command), format, dev_path);
+#pragma GCC diagnostic pop
     exec_cmd(command, 1);
     return 0;
 }
 
 // Anybody who may mount a userspace filesystem chooses names in the mount table.
-void run_umount(const char* program, const char* target)
+bool is_umount_target(const char* target)
 {
-    if (!path_is_shell_safe(target)) {
-        log_warn("umount err, target = %s\n", target);
-        return;
+    if (path_is_shell_safe(target)) {
+        return true;
     }
-    char command[UMOUNT_SIZE];
-    text_format(command, sizeof(command), "%s %s", program, target);
-    exec_cmd(command, 1);
+    log_warn("umount err, target = %s\n", target);
+    return false;
 }
 
 }  // namespace
@@ -67,42 +68,52 @@ const char* fs_mount_cmd_format(int32_t fs_type)
 
 int fs_repair_ntfs(const char* dev_path)
 {
-    return run_repair("ntfsfix", dev_path);
+    return run_repair("ntfsfix %s", dev_path);
 }
 
 int fs_repair_exfat(const char* dev_path)
 {
-    return run_repair("fsck.exfat", dev_path);
+    return run_repair("fsck.exfat %s", dev_path);
 }
 
 int fs_repair_ext2(const char* dev_path)
 {
-    return run_repair("fsck.ext2 -a", dev_path);
+    return run_repair("fsck.ext2 -a %s", dev_path);
 }
 
 int fs_repair_ext3(const char* dev_path)
 {
-    return run_repair("fsck.ext3 -a", dev_path);
+    return run_repair("fsck.ext3 -a %s", dev_path);
 }
 
 int fs_repair_ext4(const char* dev_path)
 {
-    return run_repair("fsck.ext4 -a", dev_path);
+    return run_repair("fsck.ext4 -a %s", dev_path);
 }
 
 int fs_repair_fat(const char* dev_path)
 {
-    return run_repair("fsck.fat -a", dev_path);
+    return run_repair("fsck.fat -a %s", dev_path);
 }
 
 void fs_umount(const char* target)
 {
-    run_umount("umount", target);
+    if (!is_umount_target(target)) {
+        return;
+    }
+    char command[UMOUNT_SIZE];
+    text_format(command, sizeof(command), "umount %s", target);
+    exec_cmd(command, 1);
 }
 
 void fs_umount_force(const char* target)
 {
-    run_umount("umount -f", target);
+    if (!is_umount_target(target)) {
+        return;
+    }
+    char command[UMOUNT_SIZE];
+    text_format(command, sizeof(command), "umount -f %s", target);
+    exec_cmd(command, 1);
 }
 
 int umount_dir_entries(const char* path)
@@ -118,7 +129,7 @@ int umount_dir_entries(const char* path)
         }
         char target[UMOUNT_SIZE];
         text_format(target, sizeof(target), "%s/%s", path, name);
-        run_umount("umount", target);
+        fs_umount(target);
     }
     return 0;
 }
