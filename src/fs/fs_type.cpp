@@ -55,11 +55,11 @@ void log_heading(const char* dev_path)
 
 }  // namespace
 
-// As many as the header declares, or it does not compile.
-const char* const fs_type_names[] = {
+constexpr const char* const fs_type_names[FS_CODE_COUNT] = {
     "ERR FS",  "ERR FS", "MBR",  "EXT2",     "EXT3",  "FAT",
     "HFSPLUS", "EFI",    "NTFS", "EXTENDED", "EXFAT", "EXT4",
 };
+static_assert(fs_type_names[FS_CODE_COUNT - 1] != nullptr, "each code has a name");
 
 const char* fs_type_name(int32_t fs_type)
 {
