@@ -1,5 +1,5 @@
-// The shell commands that mount, unmount and repair filesystems. What a shell would not take as one
-// plain word reaches none of them; it is logged.
+// The shell commands that mount, unmount and repair filesystems. Who fills a mount command passes
+// plain words; the others refuse and log what a shell would not take as one.
 #pragma once
 
 #include <cstdint>
