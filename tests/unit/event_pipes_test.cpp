@@ -112,6 +112,17 @@ TEST_F(EventPipes, without_its_directory_making_a_pipe_fails_with_the_systems_er
     EXPECT_TRUE(contains(log, "(No such file or directory)mknod err:")) << log;
 }
 
+TEST_F(EventPipes, pipes_in_a_directory_that_stays_somebody_elses_are_not_used)
+{
+    event_pipes_close(&pipes);
+    support::remove_all("/tmp/tarn_nas");
+    support::stub_programs stubs;
+    stubs.add("mkdir", "/bin/mkdir -p /tmp/tarn_nas && chown 12345 /tmp/tarn_nas");
+    const std::string log = capture_stdout([&] { EXPECT_EQ(event_pipes_open(&pipes), 1); });
+    EXPECT_TRUE(contains(log, "]err, dir = /tmp/tarn_nas/\n")) << log;
+    support::remove_all("/tmp/tarn_nas");
+}
+
 TEST_F(EventPipes, a_plain_file_that_comes_back_is_not_taken_for_a_pipe)
 {
     event_pipes_close(&pipes);
