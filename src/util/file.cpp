@@ -278,19 +278,22 @@ int dir_make(const char* path)
 
 int dir_make_own(const char* path)
 {
-    path_owner owner = PATH_FOREIGN;
-    for (int i = 0; i < DIR_MAKE_TRIES && owner == PATH_FOREIGN; ++i) {
+    for (int i = 0; i < DIR_MAKE_TRIES; ++i) {
         if (claim_path(path) != 0) {
             return 1;
         }
         dir_make(path);
         // Making is content with what somebody else made a moment earlier.
-        owner = path_get_owner(path);
+        if (path_get_owner(path) == PATH_OURS) {
+            return 0;
+        }
+        // Nobody is in the way: it cannot be made.
+        if (!path_exists(path)) {
+            break;
+        }
     }
-    if (owner != PATH_OURS) {
-        log_err("err, dir = %s\n", path);
-    }
-    return owner == PATH_OURS ? 0 : 1;
+    log_err("err, dir = %s\n", path);
+    return 1;
 }
 
 int fifo_create_open(const char* path)
