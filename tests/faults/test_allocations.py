@@ -16,8 +16,8 @@ HASTE = 30
 # there in every mount pass, with no wait for a mount.
 SWAPS = 8
 SWEEP_END = 240
-# Well before the disks are announced again, and with time for a slow machine.
-BY_ITSELF = 30
+# Some twenty cycles, and a little for a machine with other work.
+BY_ITSELF = 2 + 4
 CLEAN = 6
 NEVER = 1_000_000
 
