@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "util/guard.h"
 #include "util/text.h"
 
 namespace {
@@ -17,19 +18,13 @@ constexpr char OPTION_DELIMITERS[] = ".";
 // A private copy of a path: the library writes into the text that it parses, and its look-up result
 // points into it.
 struct path_copy {
-    char* text;
+    text_guard text;
 
     explicit path_copy(const char* path) : text(path != nullptr ? strdup(path) : nullptr) {}
-    path_copy(const char* path, const char* value) : text(nullptr)
+    path_copy(const char* path, const char* value)
+        : text(path != nullptr && value != nullptr ? text_join(path, "=", value) : nullptr)
     {
-        if (path == nullptr || value == nullptr) {
-            return;
-        }
-        text = text_join(path, "=", value);
     }
-    ~path_copy() { free(text); }
-    path_copy(const path_copy&) = delete;
-    path_copy& operator=(const path_copy&) = delete;
 };
 
 bool look_up(uci_context* ctx, const path_copy& path, uci_ptr* ptr)

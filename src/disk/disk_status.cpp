@@ -8,6 +8,7 @@
 #include "fs/fs_type.h"
 #include "log/log.h"
 #include "util/file.h"
+#include "util/guard.h"
 #include "util/paths.h"
 #include "util/text.h"
 
@@ -102,12 +103,11 @@ void add_disk(cJSON* array, disk_obj* disk)
 
 void print_to_file(const cJSON* root)
 {
-    char* text = cJSON_Print(root);
+    const text_guard text(cJSON_Print(root));
     if (text == nullptr) {
         return;
     }
     write_text(DISK_JSON_FILE, text);
-    free(text);
 }
 
 }  // namespace

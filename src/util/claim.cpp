@@ -10,6 +10,7 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/guard.h"
 #include "util/paths.h"
 #include "util/text.h"
 
@@ -74,9 +75,8 @@ int claim_file(const char* path)
         if (free_name(path) != 0) {
             return 1;
         }
-        const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, PRIVATE_MODE);
-        if (fd >= 0) {
-            close(fd);
+        const fd_guard file(open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, PRIVATE_MODE));
+        if (file >= 0) {
             return 0;
         }
         if (errno != EEXIST) {

@@ -11,6 +11,7 @@
 #include "log/log.h"
 #include "util/claim.h"
 #include "util/exec.h"
+#include "util/guard.h"
 #include "util/text.h"
 
 namespace {
@@ -18,41 +19,18 @@ namespace {
 constexpr mode_t PRIVATE_MODE = 0600;
 constexpr int DIR_MAKE_TRIES = 8;
 
-// A descriptor that closes itself.
-struct fd_guard {
-    int fd;
-
-    explicit fd_guard(int descriptor) : fd(descriptor) {}
-    ~fd_guard()
-    {
-        if (fd >= 0) {
-            close(fd);
-        }
-    }
-    fd_guard(const fd_guard&) = delete;
-    fd_guard& operator=(const fd_guard&) = delete;
-};
-
-int write_and_close(FILE* stream, const void* bytes, int32_t length)
+int write_all(FILE* stream, const void* bytes, int32_t length)
 {
     const int ret = stream_write_all(stream, bytes, length);
     if (ret != 0) {
         log_info("file write err, len = %d, ret = %d\n", length, ret);
     }
-    fclose(stream);
     return ret == 0 ? 0 : 1;
 }
 
 }  // namespace
 
 dir_stream::dir_stream(const char* path) : stream(path != nullptr ? opendir(path) : nullptr) {}
-
-dir_stream::~dir_stream()
-{
-    if (stream != nullptr) {
-        closedir(stream);
-    }
-}
 
 const char* dir_stream::next_name()
 {
@@ -126,12 +104,12 @@ int file_write(const char* path, const void* bytes, int32_t length)
     if (path == nullptr || bytes == nullptr) {
         return 1;
     }
-    FILE* stream = fopen(path, "w");
+    const stream_guard stream(fopen(path, "w"));
     if (stream == nullptr) {
         log_info("file not exist, fn = %s\n", path);
         return 1;
     }
-    return write_and_close(stream, bytes, length);
+    return write_all(stream, bytes, length);
 }
 
 int file_append(const char* path, const void* bytes, int32_t length)
@@ -139,12 +117,12 @@ int file_append(const char* path, const void* bytes, int32_t length)
     if (path == nullptr || bytes == nullptr) {
         return 1;
     }
-    FILE* stream = fopen(path, "at+");
+    const stream_guard stream(fopen(path, "at+"));
     if (stream == nullptr) {
         log_err("open err, file = %s\n", path);
         return 1;
     }
-    return write_and_close(stream, bytes, length);
+    return write_all(stream, bytes, length);
 }
 
 int fd_read_full(int fd, void* buffer, int32_t length)
@@ -169,15 +147,15 @@ int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length)
         return 1;
     }
     const fd_guard file(open(path, O_RDWR | O_CREAT | O_SYNC | O_CLOEXEC, PRIVATE_MODE));
-    if (file.fd < 0) {
+    if (file < 0) {
         log_err("err!\n");
         return 1;
     }
-    if (offset > 0 && lseek(file.fd, offset, SEEK_SET) != offset) {
+    if (offset > 0 && lseek(file, offset, SEEK_SET) != offset) {
         log_err("seek err!\n");
         return 1;
     }
-    const int ret = fd_read_full(file.fd, buffer, length);
+    const int ret = fd_read_full(file, buffer, length);
     if (ret != 0) {
         log_err("read err, ret=%d, len=%d\n", ret, length);
     }
@@ -204,22 +182,21 @@ char* file_read_all(const char* path)
         return nullptr;
     }
     const fd_guard file(open(path, O_RDONLY | O_CLOEXEC));
-    if (file.fd < 0) {
+    if (file < 0) {
         log_info("open file err, file = %s\n", path);
         return nullptr;
     }
-    auto* content = static_cast<char*>(calloc(1, static_cast<size_t>(size) + 1));
+    text_guard content(static_cast<char*>(calloc(1, static_cast<size_t>(size) + 1)));
     if (content == nullptr) {
         log_err("calloc err!\n");
         return nullptr;
     }
-    const int ret = fd_read_full(file.fd, content, static_cast<int32_t>(size));
+    const int ret = fd_read_full(file, content, static_cast<int32_t>(size));
     if (ret != 0) {
         log_err("err, fn = %s, ret = %d, file_size = %d\n", path, ret, static_cast<int>(size));
-        free(content);
         return nullptr;
     }
-    return content;
+    return content.release();
 }
 
 int file_read_buf(const char* path, void* buffer, int32_t size)
@@ -233,12 +210,12 @@ int file_read_buf(const char* path, void* buffer, int32_t size)
     }
     memset(buffer, 0, static_cast<size_t>(size));
     const fd_guard file(open(path, O_RDONLY | O_CLOEXEC));
-    if (file.fd < 0) {
+    if (file < 0) {
         log_info("open file err, file = %s\n", path);
         return 1;
     }
     // A file shorter than the buffer is the ordinary case.
-    fd_read_full(file.fd, buffer, size);
+    fd_read_full(file, buffer, size);
     return 0;
 }
 
@@ -266,14 +243,12 @@ int dir_make(const char* path)
     if (path_exists(path)) {
         return 0;
     }
-    char* command = text_join("mkdir -p '", path, "'");
+    const text_guard command(text_join("mkdir -p '", path, "'"));
     if (command == nullptr) {
         log_err("err!\n");
         return 1;
     }
-    const int ret = exec_cmd(command, 1);
-    free(command);
-    return ret;
+    return exec_cmd(command, 1);
 }
 
 int dir_make_own(const char* path)

@@ -3,22 +3,19 @@
 // logged where it happens.
 #pragma once
 
-#include <dirent.h>
-
 #include <cstdint>
 #include <cstdio>
+
+#include "util/guard.h"
 
 // Largest file that file_read_all takes: a runaway scratch file must not exhaust a router's memory.
 constexpr int64_t FILE_READ_ALL_MAX = 0x7FFFFF;
 
 // An open directory that closes itself; stream is null when it could not be opened.
 struct dir_stream {
-    DIR* stream;
+    dir_guard stream;
 
     explicit dir_stream(const char* path);
-    ~dir_stream();
-    dir_stream(const dir_stream&) = delete;
-    dir_stream& operator=(const dir_stream&) = delete;
 
     // Reading broke off, which is logged: what came so far is not the whole directory.
     bool failed = false;

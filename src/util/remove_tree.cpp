@@ -10,6 +10,7 @@
 #include "log/log.h"
 #include "util/exec.h"
 #include "util/file.h"
+#include "util/guard.h"
 #include "util/text.h"
 
 namespace {
@@ -60,9 +61,8 @@ int path_rm_rf(const char* path)
     if (path == nullptr) {
         return 1;
     }
-    char* command = is_quotable(path) ? text_join("rm -rf \"", path, "\"") : nullptr;
+    const text_guard command(is_quotable(path) ? text_join("rm -rf \"", path, "\"") : nullptr);
     const bool done = command != nullptr && exec_cmd(command, 1) == 0;
-    free(command);
     if (!done) {
         log_errno("rm err, fn = %s\n", path);
     }

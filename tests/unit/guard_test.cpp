@@ -1,0 +1,104 @@
+#include "util/guard.h"
+
+#include <fcntl.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+int open_null()
+{
+    return open("/dev/null", O_RDWR | O_CLOEXEC);
+}
+
+bool is_open(int descriptor)
+{
+    return fcntl(descriptor, F_GETFD) >= 0 || errno != EBADF;
+}
+
+int texts_given_back = 0;
+
+void count_text(char* text)
+{
+    ++texts_given_back;
+    free(text);
+}
+
+using counted_text = guard<char*, nullptr, count_text>;
+
+TEST(Guard, GivesBackWhatItHoldsAtTheEndOfItsScope)
+{
+    int descriptor = -1;
+    {
+        const fd_guard file(open_null());
+        ASSERT_GE(file, 0);
+        descriptor = file;
+        EXPECT_TRUE(is_open(descriptor));
+    }
+    EXPECT_FALSE(is_open(descriptor));
+}
+
+TEST(Guard, GivesBackNothingWhenItHoldsNothing)
+{
+    texts_given_back = 0;
+    {
+        const counted_text none(nullptr);
+        EXPECT_EQ(none, nullptr);
+    }
+    EXPECT_EQ(texts_given_back, 0);
+}
+
+TEST(Guard, WhatIsReleasedStaysOpen)
+{
+    int descriptor = -1;
+    {
+        fd_guard file(open_null());
+        descriptor = file.release();
+        EXPECT_EQ(file, -1);
+    }
+    const fd_guard owner(descriptor);
+    EXPECT_TRUE(is_open(owner));
+}
+
+TEST(Guard, TakingAnotherThingGivesBackTheFirst)
+{
+    texts_given_back = 0;
+    {
+        counted_text text(strdup("one"));
+        text.reset(strdup("two"));
+        EXPECT_EQ(texts_given_back, 1);
+        EXPECT_STREQ(text, "two");
+    }
+    EXPECT_EQ(texts_given_back, 2);
+}
+
+TEST(Guard, DescriptorZeroIsSomething)
+{
+    const int saved = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 3);
+    fd_guard input(STDIN_FILENO);
+    input.reset(-1);
+    EXPECT_FALSE(is_open(STDIN_FILENO));
+    if (saved >= 0) {
+        const fd_guard original(saved);
+        EXPECT_EQ(dup2(original, STDIN_FILENO), STDIN_FILENO);
+    }
+}
+
+TEST(Guard, ClosingAStreamTellsThatTheDiskIsFull)
+{
+    stream_guard full(fopen("/dev/full", "we"));
+    ASSERT_NE(full, nullptr);
+    EXPECT_GT(fputs("text", full), 0);
+    EXPECT_FALSE(stream_close(full));
+    EXPECT_EQ(full, nullptr);
+
+    stream_guard null(fopen("/dev/null", "we"));
+    ASSERT_NE(null, nullptr);
+    EXPECT_GT(fputs("text", null), 0);
+    EXPECT_TRUE(stream_close(null));
+}
+
+}  // namespace
