@@ -16,7 +16,7 @@
 
 namespace {
 
-constexpr size_t ROOT_NAME_SIZE = 64;
+constexpr size_t ROOT_DEV_SIZE = 64;
 constexpr int32_t BLKID_TEXT_SIZE = 512;
 constexpr size_t LINK_TARGET_SIZE = 256;
 constexpr int SDCARD_POINT_SIZE = 16;
@@ -39,18 +39,19 @@ void read_blkid_line(const char* dev_name, const char* dev_path, char (&text)[BL
 
 // The disk of the inventory that owns a partition, added when it is missing; null when there is
 // none.
-disk_obj* find_or_add_owner(disk_sets* sets, const char* root_name)
+disk_obj* find_or_add_owner(disk_sets* sets, const char* root_dev)
 {
-    if (disk_sets_find_disk(sets, root_name) == nullptr) {
-        log_err("not find disk obj, root dev name = %s\n", root_name);
-        if (disk_sets_add_disk(sets, root_name) != 0) {
+    if (disk_sets_find_disk(sets, root_dev) == nullptr) {
+        // An error by its level, and ordinary: a new disk's first message is often a partition's.
+        log_err("not find disk obj, root dev name = %s\n", root_dev);
+        if (disk_sets_add_disk(sets, root_dev) != 0) {
             log_err("err!\n");
             return nullptr;
         }
     }
-    disk_entry* entry = disk_sets_find_disk(sets, root_name);
+    disk_entry* entry = disk_sets_find_disk(sets, root_dev);
     if (entry == nullptr) {
-        log_err("Not find root part, dev = %s\n", root_name);
+        log_err("Not find root part, dev = %s\n", root_dev);
         return nullptr;
     }
     return &entry->disk;
@@ -83,6 +84,7 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
         return 0;
     }
     if (disk_sets_find_part(sets, dev_name) != nullptr) {
+        // On every ordinary plug: adding a disk takes in its partitions, whose own messages follow.
         log_warn("=== ===> dev is already add! dev name = %s\n", dev_name);
         return 0;
     }
@@ -94,14 +96,14 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
     return 0;
 }
 
-int disk_sets_add_disk(disk_sets* sets, const char* disk_name)
+int disk_sets_add_disk(disk_sets* sets, const char* root_dev)
 {
     disk_entry* entry = disk_sets_get_free_entry(sets);
     if (entry == nullptr) {
         return 1;
     }
     disk_obj* disk = &entry->disk;
-    disk_obj_set_root(disk, disk_name);
+    disk_obj_set_root(disk, root_dev);
     disk_obj_detect_sd_card(disk);
     disk_obj_scan_parts(disk);
     log_root_fs(disk);
@@ -121,19 +123,19 @@ int disk_sets_add_disk(disk_sets* sets, const char* disk_name)
     return 0;
 }
 
-void disk_sets_add_part(disk_sets* sets, const char* part_name)
+void disk_sets_add_part(disk_sets* sets, const char* dev_name)
 {
-    char root_name[ROOT_NAME_SIZE]{};
-    if (sys_block_find_parent(part_name, root_name, sizeof(root_name)) != 0) {
-        log_err("not find dev name = %s\n", part_name);
+    char root_dev[ROOT_DEV_SIZE]{};
+    if (sys_block_find_parent(dev_name, root_dev, sizeof(root_dev)) != 0) {
+        log_err("not find dev name = %s\n", dev_name);
         return;
     }
-    disk_obj* disk = find_or_add_owner(sets, root_name);
+    disk_obj* disk = find_or_add_owner(sets, root_dev);
     // Adding the owner has scanned all its partitions, this one included as a rule.
-    if (disk == nullptr || disk_obj_has_dev(disk, part_name) == 0) {
+    if (disk == nullptr || disk_obj_has_dev(disk, dev_name) == 0) {
         return;
     }
-    if (disk_obj_add_sub_part(disk, part_name) == 0) {
+    if (disk_obj_add_sub_part(disk, dev_name) == 0) {
         // A partition without a size would be dropped as small by the next mount pass. The slots
         // are not sorted: those that are mounted must keep their numbers.
         disk_obj_read_sizes(disk);

@@ -9,10 +9,10 @@
 int disk_sets_add_dev(disk_sets* sets, const char* dev_name);
 
 // Adds a whole disk with all its partitions. 0 added, 1 table full.
-int disk_sets_add_disk(disk_sets* sets, const char* disk_name);
+int disk_sets_add_disk(disk_sets* sets, const char* root_dev);
 
 // Adds a partition, and its disk when that is missing.
-void disk_sets_add_part(disk_sets* sets, const char* part_name);
+void disk_sets_add_part(disk_sets* sets, const char* dev_name);
 
 // 0 when blkid identifies the device, else 1. A name that no kernel device has is never put into a
 // command.

@@ -108,13 +108,13 @@ part_info* disk_obj_get_part(disk_obj* disk, const char* dev_name)
     return nullptr;
 }
 
-part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* disk_name)
+part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* dir_name)
 {
     if (disk == nullptr) {
         return nullptr;
     }
     for (part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.disk_name, disk_name) == 0) {
+        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.disk_name, dir_name) == 0) {
             return &slot.part;
         }
     }

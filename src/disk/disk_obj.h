@@ -31,8 +31,8 @@ int disk_obj_add_sub_part(disk_obj* disk, const char* dev_name);
 // The root or the in-use slot of that device name, null when none.
 part_info* disk_obj_get_part(disk_obj* disk, const char* dev_name);
 
-// The in-use slot of that mount directory name, null when none.
-part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* disk_name);
+// The in-use slot of that directory name, null when none.
+part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* dir_name);
 
 // 0 when the root or a slot has that device name, 1 when none has.
 int disk_obj_has_dev(const disk_obj* disk, const char* dev_name);

@@ -54,14 +54,14 @@ disk_entry* disk_sets_get_free_entry(disk_sets* sets)
     return nullptr;
 }
 
-disk_entry* disk_sets_find_disk(disk_sets* sets, const char* root_name)
+disk_entry* disk_sets_find_disk(disk_sets* sets, const char* root_dev)
 {
     if (sets == nullptr) {
         return nullptr;
     }
     for (disk_entry& entry : sets->entries) {
-        if (entry.in_use == 1 && str_equal_nullsafe(entry.disk.root.dev_name, root_name) == 0) {
-            log_info("get disk, root name = %s\n", root_name);
+        if (entry.in_use == 1 && str_equal_nullsafe(entry.disk.root.dev_name, root_dev) == 0) {
+            log_info("get disk, root name = %s\n", root_dev);
             disk_obj_dump(&entry.disk);
             return &entry;
         }

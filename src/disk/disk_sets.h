@@ -28,7 +28,7 @@ int disk_sets_free(disk_sets* sets);
 disk_entry* disk_sets_get_free_entry(disk_sets* sets);
 
 // The entry whose root has that device name, null when none. Dumps the disk it finds.
-disk_entry* disk_sets_find_disk(disk_sets* sets, const char* root_name);
+disk_entry* disk_sets_find_disk(disk_sets* sets, const char* root_dev);
 
 // The root or slot of that device name on any disk, null when none.
 part_info* disk_sets_find_part(disk_sets* sets, const char* dev_name);
@@ -47,5 +47,7 @@ void disk_sets_dump(const disk_sets* sets);
 // Exchange sort by the roots' sizes, largest first, free entries last; every ref_root follows.
 int disk_sets_sort_by_size(disk_sets* sets);
 
-// Frees the entries of disks that hold neither a valid partition nor a filesystem of their own.
+// Frees the entries of disks that hold neither a valid partition nor a filesystem of their own. A
+// disk that waits for its first mount pass has no valid partition either: "A new disk can be
+// forgotten" in docs/limits.md.
 int disk_sets_clear_empty(disk_sets* sets);

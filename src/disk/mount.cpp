@@ -175,12 +175,16 @@ void mount_part(part_info* part)
     }
     char dev_path[DEV_PATH_SIZE];
     path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    // Without a name it is not published: what somebody else has mounted is not ours to offer. See
+    // "A device that is mounted already" in docs/limits.md.
     text_clear(part->disk_name);
     if (is_dev_mounted(dev_path) == 1) {
         log_warn("already mounted, dev = %s\n", dev_path);
         return;
     }
     plan_mount_path(part);
+    // The row is written before anybody knows whether the mount will come about, also for a type
+    // that is never mounted: "A failed mount is remembered like a good one" in docs/limits.md.
     sync_part_with_db(part);
 
     const char* format = fs_mount_cmd_format(part->fs_type);

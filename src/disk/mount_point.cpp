@@ -95,6 +95,8 @@ int32_t get_mount_point_num(const disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
+    // A table that cannot be read counts as empty: the disk needs a number now, and mount_part looks
+    // again before it mounts.
     mount_table table;
     read_mount_table(&table);
 
@@ -125,6 +127,7 @@ int set_all_mount_point_num(disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
+    // One that cannot be read counts as empty, as above.
     mount_table table;
     read_mount_table(&table);
 
@@ -227,6 +230,7 @@ int check_mount_dev_exist()
 
 void umount_all_force()
 {
+    // What cannot be listed stays mounted: its device then counts as mounted already.
     mount_table table;
     read_mount_table(&table);
     for (int i = 0; i < table.num; ++i) {

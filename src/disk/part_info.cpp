@@ -91,6 +91,8 @@ int part_info_fill(part_info* part)
 
 void part_info_set_length(part_info* part)
 {
+    // The hardware sector is the unit, though the kernel counts in 512 bytes: "Sizes on disks whose
+    // hardware sector is not 512 bytes" in docs/limits.md.
     part->total_len = (part->sector_number * part->sector_size) >> MIB_SHIFT;
 }
 

@@ -81,11 +81,11 @@ int umount_disk_parts(disk_obj* disk)
     return 0;
 }
 
-int remove_root_part(disk_sets* sets, const char* disk_name)
+int remove_root_part(disk_sets* sets, const char* root_dev)
 {
-    disk_entry* entry = disk_sets_find_disk(sets, disk_name);
+    disk_entry* entry = disk_sets_find_disk(sets, root_dev);
     if (entry == nullptr) {
-        log_warn("remove root part[%s] err!\n", disk_name);
+        log_warn("remove root part[%s] err!\n", root_dev);
         return 1;
     }
     umount_disk_parts(&entry->disk);
@@ -121,6 +121,8 @@ int remove_dev(disk_sets* sets, const char* dev_name)
         log_warn("want remove dev(%s) not exist!\n", dev_name);
         return 0;
     }
+    // A disk that the kernel no longer lists goes the partition's way, which leaves its entry: "A
+    // pulled disk stays until its partitions are told" in docs/limits.md.
     if (sys_block_has_dev(dev_name) != 0) {
         log_warn("remove sub dev = %s\n", dev_name);
         remove_sub_part(sets, dev_name);
@@ -132,17 +134,17 @@ int remove_dev(disk_sets* sets, const char* dev_name)
     return 0;
 }
 
-int remove_disk(disk_sets* sets, const char* disk_name)
+int remove_disk(disk_sets* sets, const char* dir_name)
 {
     if (sets == nullptr) {
         return 1;
     }
-    log_info("remove disk name = %s\n", disk_name);
+    log_info("remove disk name = %s\n", dir_name);
     for (disk_entry& entry : sets->entries) {
         if (entry.in_use == 0) {
             continue;
         }
-        part_info* part = disk_obj_find_part_by_disk_name(&entry.disk, disk_name);
+        part_info* part = disk_obj_find_part_by_disk_name(&entry.disk, dir_name);
         if (part != nullptr) {
             umount_part(part);
             disk_obj_clear_part(&entry.disk, part);

@@ -1,4 +1,5 @@
-// Unmounting and forgetting partitions and disks.
+// Unmounting and forgetting partitions and disks. A name is a kernel device name (dev_name), that of
+// a whole disk (root_dev), or a directory name below the mount base (dir_name).
 #pragma once
 
 #include "disk/disk_sets.h"
@@ -13,7 +14,7 @@ void umount_part(const part_info* part);
 int umount_disk_parts(disk_obj* disk);
 
 // Unmounts and forgets the disk of that name. 0, 1 when there is none.
-int remove_root_part(disk_sets* sets, const char* disk_name);
+int remove_root_part(disk_sets* sets, const char* root_dev);
 
 // Unmounts and forgets the partition of that device name. Always 0, 1 for a null table.
 int remove_sub_part(disk_sets* sets, const char* dev_name);
@@ -21,9 +22,9 @@ int remove_sub_part(disk_sets* sets, const char* dev_name);
 // Either of the two, whichever the name is at the moment. Always 0, 1 for a null table.
 int remove_dev(disk_sets* sets, const char* dev_name);
 
-// Unmounts and forgets the partition mounted in that directory (disk1_part2); a whole disk's is not
+// Unmounts and forgets the partition of that directory name (disk1_part2); a whole disk's is not
 // looked for. Always 0, 1 for a null table.
-int remove_disk(disk_sets* sets, const char* disk_name);
+int remove_disk(disk_sets* sets, const char* dir_name);
 
 // Unmounts and forgets every disk that the kernel lists. 0, 1 when /sys/block cannot be read.
 int safe_remove_all(disk_sets* sets);
