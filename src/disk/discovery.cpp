@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "disk/mount_point.h"
+#include "disk/system_disk.h"
 #include "fs/fs_type.h"
 #include "log/log.h"
 #include "util/block_dev.h"
@@ -62,6 +63,16 @@ void log_root_fs(const disk_obj* disk)
     log_info("root part fs = %s\n", fs_type_name(disk->root.fs_type));
 }
 
+// True, which is logged, when the disk is none for users.
+bool is_kept_out(const char* root_dev)
+{
+    if (!is_system_disk(root_dev)) {
+        return false;
+    }
+    log_warn("router's own disk, dev = %s\n", root_dev);
+    return true;
+}
+
 // True when the disk hangs on the router's SD card reader.
 bool is_at_sdcard_point(const char* link_target)
 {
@@ -90,7 +101,7 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
     }
     if (sys_block_has_dev(dev_name) != 0) {
         disk_sets_add_part(sets, dev_name);
-    } else if (dev_name_is_disk(dev_name) == 0) {
+    } else if (dev_name_is_disk(dev_name) == 0 && !is_kept_out(dev_name)) {
         disk_sets_add_disk(sets, dev_name);
     }
     return 0;
@@ -128,6 +139,9 @@ void disk_sets_add_part(disk_sets* sets, const char* dev_name)
     char root_dev[ROOT_DEV_SIZE]{};
     if (sys_block_find_parent(dev_name, root_dev, sizeof(root_dev)) != 0) {
         log_err("not find dev name = %s\n", dev_name);
+        return;
+    }
+    if (is_kept_out(root_dev)) {
         return;
     }
     disk_obj* disk = find_or_add_owner(sets, root_dev);

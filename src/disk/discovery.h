@@ -4,8 +4,8 @@
 #include "disk/disk_sets.h"
 
 // Adds the disk or partition of that name, or nothing when blkid does not know it, it is no device
-// that the daemon handles, the table is full or some disk holds it already. Always 0, 1 for a null
-// table.
+// that the daemon handles or the router's own, the table is full or some disk holds it already.
+// Always 0, 1 for a null table.
 int disk_sets_add_dev(disk_sets* sets, const char* dev_name);
 
 // Adds a whole disk with all its partitions. 0 added, 1 table full.

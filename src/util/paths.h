@@ -25,6 +25,9 @@ inline constexpr char HOTPLUG_MOUNT_HOOK[] = "/etc/hotplug.d/block/10-mount";
 // The kernel's.
 inline constexpr char SYS_BLOCK[] = "/sys/block";
 
+// What the router itself runs from is mounted at these, where it has them.
+inline constexpr const char* SYSTEM_DIRS[] = {"/", "/rom", "/overlay", "/boot"};
+
 // Output of outside programs on its way back to us.
 inline constexpr char SCRATCH_PGREP[] = "/tmp/disk_pid_tmp";
 inline constexpr char SCRATCH_PIDOF[] = "/tmp/pid";
