@@ -3,6 +3,7 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/guard.h"
 #include "util/text.h"
 
 namespace {
@@ -16,6 +17,7 @@ int log_code_and_error(sqlite_handle* handle, int code)
     return 1;
 }
 
+// All values or none: an index beyond the statement's parameters is an error of the library's.
 int bind_all(sqlite3_stmt* stmt, std::span<const char* const> values)
 {
     int index = 0;
@@ -26,6 +28,28 @@ int bind_all(sqlite3_stmt* stmt, std::span<const char* const> values)
         }
     }
     return SQLITE_OK;
+}
+
+bool run_bound(sqlite3* db, const char* sql, std::span<const char* const> values)
+{
+    sqlite3_stmt* prepared = nullptr;
+    const int code = sqlite3_prepare(db, sql, -1, &prepared, nullptr);
+    const guard<sqlite3_stmt*, nullptr, sqlite3_finalize> statement(prepared);
+    return code == SQLITE_OK && bind_all(statement, values) == SQLITE_OK &&
+           sqlite3_step(statement) == SQLITE_DONE;
+}
+
+int prepare(sqlite_handle* handle, const char* sql, const char* shown)
+{
+    const auto length = static_cast<int>(strlen(sql));
+    const int code = sqlite3_prepare(handle->db, sql, length, &handle->stmt, nullptr);
+    if (code == SQLITE_OK) {
+        return 0;
+    }
+    log_err("err code = %d\n", code);
+    log_err("sq = %s\n", shown);
+    db_log_error(handle);
+    return 1;
 }
 
 void clear(sqlite_handle* handle)
@@ -92,16 +116,16 @@ int db_exec(sqlite_handle* handle, const char* sql)
         log_err("err!\n");
         return 1;
     }
-    char* message = nullptr;
-    const int code = sqlite3_exec(handle->db, sql, nullptr, nullptr, &message);
-    if (code != SQLITE_OK) {
-        if (message != nullptr) {
-            log_err("err str = %s\n", message);
-        }
-        db_log_error(handle);
+    guard<char*, nullptr, sqlite3_free> message(nullptr);
+    const int code = sqlite3_exec(handle->db, sql, nullptr, nullptr, &message.held);
+    if (code == SQLITE_OK) {
+        return 0;
     }
-    sqlite3_free(message);
-    return code == SQLITE_OK ? 0 : 1;
+    if (message != nullptr) {
+        log_err("err str = %s\n", message.held);
+    }
+    db_log_error(handle);
+    return 1;
 }
 
 int db_exec_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values)
@@ -110,17 +134,13 @@ int db_exec_bound(sqlite_handle* handle, const char* sql, std::span<const char* 
         log_err("err!\n");
         return 1;
     }
-    const bool done = sqlite3_prepare(handle->db, sql, -1, &handle->stmt, nullptr) == SQLITE_OK &&
-                      bind_all(handle->stmt, values) == SQLITE_OK &&
-                      sqlite3_step(handle->stmt) == SQLITE_DONE;
-    // The step itself only says that something failed; finalizing tells what.
-    sqlite3_finalize(handle->stmt);
-    handle->stmt = nullptr;
-    if (!done) {
-        log_err("err str = %s\n", sqlite3_errmsg(handle->db));
-        db_log_error(handle);
+    if (run_bound(handle->db, sql, values)) {
+        return 0;
     }
-    return done ? 0 : 1;
+    // The step itself only says that something failed; the statement's end has told what.
+    log_err("err str = %s\n", sqlite3_errmsg(handle->db));
+    db_log_error(handle);
+    return 1;
 }
 
 int db_prepare(sqlite_handle* handle, const char* sql)
@@ -129,20 +149,17 @@ int db_prepare(sqlite_handle* handle, const char* sql)
         log_err("err!\n");
         return 1;
     }
-    const auto length = static_cast<int>(strlen(sql));
-    const int code = sqlite3_prepare(handle->db, sql, length, &handle->stmt, nullptr);
-    if (code != SQLITE_OK) {
-        log_err("err code = %d\n", code);
-        log_err("sq = %s\n", sql);
-        db_log_error(handle);
-        return 1;
-    }
-    return 0;
+    return prepare(handle, sql, sql);
 }
 
-int db_prepare_bound(sqlite_handle* handle, const char* sql, std::span<const char* const> values)
+int db_prepare_bound(sqlite_handle* handle, const char* sql, const char* shown,
+                     std::span<const char* const> values)
 {
-    if (db_prepare(handle, sql) != 0) {
+    if (handle == nullptr || handle->db == nullptr || sql == nullptr || shown == nullptr) {
+        log_err("err!\n");
+        return 1;
+    }
+    if (prepare(handle, sql, shown) != 0) {
         return 1;
     }
     const int code = bind_all(handle->stmt, values);
@@ -154,13 +171,13 @@ int db_prepare_bound(sqlite_handle* handle, const char* sql, std::span<const cha
     return 0;
 }
 
-int db_step_is_one(sqlite_handle* handle)
+one_answer db_step_is_one(sqlite_handle* handle)
 {
+    const statement_guard statement(handle);
     int code = sqlite3_step(handle->stmt);
     if (code != SQLITE_ROW && code != SQLITE_DONE) {
         log_code_and_error(handle, code);
-        db_finalize(handle);
-        return -1;
+        return ONE_UNKNOWN;
     }
     const int columns = sqlite3_column_count(handle->stmt);
     int value = 0;
@@ -169,32 +186,38 @@ int db_step_is_one(sqlite_handle* handle)
             value = sqlite3_column_int(handle->stmt, i);
         }
     }
-    db_finalize(handle);
-    return value == 1 ? 1 : 0;
+    return value == 1 ? ONE_IS : ONE_NOT;
 }
 
 int db_table_exists(sqlite_handle* handle, const char* table)
 {
     if (handle == nullptr || handle->db == nullptr || table == nullptr) {
         log_err("err!\n");
-        return -1;
+        return TABLE_UNKNOWN;
     }
     char query[TABLE_QUERY_SIZE];
     text_format(query, sizeof(query),
                 "select count(*) from sqlite_master where type='table' and name='%s'", table);
     if (db_prepare(handle, query) != 0) {
         log_err("err!\n");
-        return -1;
+        return TABLE_UNKNOWN;
     }
-    const int found = db_step_is_one(handle);
-    if (found < 0) {
-        return -1;
+    switch (db_step_is_one(handle)) {
+        case ONE_IS:
+            return TABLE_EXISTS;
+        case ONE_NOT:
+            return TABLE_MISSING;
+        case ONE_UNKNOWN:
+            break;
     }
-    return found == 1 ? 0 : 1;
+    return TABLE_UNKNOWN;
 }
 
 void db_log_error(sqlite_handle* handle)
 {
+    if (handle == nullptr) {
+        return;
+    }
     log_info("sqlite err code = %d\n", sqlite3_errcode(handle->db));
     log_info("sqlite err = %s\n", sqlite3_errmsg(handle->db));
 }

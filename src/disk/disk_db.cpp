@@ -13,89 +13,85 @@ namespace {
 constexpr char TABLE[] = "disk";
 constexpr size_t STATEMENT_SIZE = 512;
 constexpr int COLUMN_COUNT = 5;
-constexpr int MAX_VALUES = 5;
 
-// The statement texts. The first %s is the table, each '%s' a value.
+// A statement with N values in its two forms. As shown in the log, for people to read and paste:
+// the first %s is the table, the others are the values. As run, with a parameter for each value: a
+// quote in a value is then data like any other.
+template <size_t N>
+struct statement {
+    const char* shown;
+    const char* run;
+};
+
+template <size_t N>
+using statement_values = const char* const (&)[N];
+
 constexpr char CREATE_TABLE[] =
     "CREATE TABLE %s (uid TEXT,dev_name TEXT,disk_name TEXT,mount_path TEXT,mountd TEXT);";
-constexpr char COUNT_UID[] = "select count(*) from %s where uid='%s'";
-constexpr char SELECT_UID[] = "select * from %s where uid='%s'";
-constexpr char INSERT[] = "insert into %s values('%s','%s','%s','%s','%s')";
-constexpr char UPDATE_MOUNTD[] = "update %s set mountd='%s'where uid='%s'";
-constexpr char UPDATE_PATHS[] =
-    "update %s set dev_name='%s',disk_name='%s',mount_path='%s' where uid='%s'";
-constexpr char UPDATE_ALL[] =
-    "update %s set dev_name='%s',disk_name='%s',mount_path='%s',mountd='%s' where uid='%s'";
-
-struct value_list {
-    const char* values[MAX_VALUES];
-    int count;
+constexpr statement<1> COUNT_UID{
+    "select count(*) from %s where uid='%s'",
+    "select count(*) from disk where uid=?",
+};
+constexpr statement<1> SELECT_UID{
+    "select * from %s where uid='%s'",
+    "select * from disk where uid=?",
+};
+constexpr statement<5> INSERT{
+    "insert into %s values('%s','%s','%s','%s','%s')",
+    "insert into disk values(?,?,?,?,?)",
+};
+constexpr statement<2> UPDATE_MOUNTD{
+    "update %s set mountd='%s'where uid='%s'",
+    "update disk set mountd=? where uid=?",
+};
+constexpr statement<4> UPDATE_PATHS{
+    "update %s set dev_name='%s',disk_name='%s',mount_path='%s' where uid='%s'",
+    "update disk set dev_name=?,disk_name=?,mount_path=? where uid=?",
+};
+constexpr statement<5> UPDATE_ALL{
+    "update %s set dev_name='%s',disk_name='%s',mount_path='%s',mountd='%s' where uid='%s'",
+    "update disk set dev_name=?,disk_name=?,mount_path=?,mountd=? where uid=?",
 };
 
-// Appends to a buffer of fixed size and cuts what does not fit.
-struct text_builder {
-    char* out;
-    size_t size;
-    size_t used;
-
-    void append(const char* text, size_t length)
-    {
-        text_copy_n(out + used, size - used, text, length);
-        used += strlen(out + used);
-    }
-};
-
-// Fills a statement text. Each value stands in it as text, for people to read, or as a parameter,
-// for SQLite to run: a quote in a value is then data like any other.
-void build_statement(char (&out)[STATEMENT_SIZE], const char* format, const value_list* readable)
+// The shown form with its words filled in, cut to the buffer.
+void fill_words(char (&out)[STATEMENT_SIZE], const char* shown, std::span<const char* const> values)
 {
-    text_builder builder{out, sizeof(out), 0};
-    bool table_done = false;
-    int next_value = 0;
-    const char* rest = format;
-    while (const char* mark = strstr(rest, "%s")) {
-        const bool as_parameter = table_done && readable == nullptr;
-        const auto before = static_cast<size_t>(mark - rest);
-        builder.append(rest, as_parameter ? before - 1 : before);
-        rest = mark + strlen("%s");
-        if (!table_done) {
-            builder.append(TABLE, strlen(TABLE));
-            table_done = true;
-        } else if (as_parameter) {
-            builder.append("?", 1);
-            ++rest;
-        } else {
-            const char* value = readable->values[next_value++];
-            builder.append(value, strlen(value));
+    const char* word = TABLE;
+    size_t used = 0;
+    while (const char* mark = strstr(shown, "%s")) {
+        text_format(out + used, sizeof(out) - used, "%.*s%s", static_cast<int>(mark - shown), shown,
+                    word);
+        used += strlen(out + used);
+        shown = mark + strlen("%s");
+        if (!values.empty()) {
+            word = values.front();
+            values = values.subspan(1);
         }
     }
-    builder.append(rest, strlen(rest));
+    text_copy(out + used, sizeof(out) - used, shown);
 }
 
-std::span<const char* const> bound_values(const value_list& values)
+template <size_t N>
+int prepare_select(sqlite_handle* handle, const statement<N>& select, statement_values<N> values)
 {
-    return {values.values, static_cast<size_t>(values.count)};
+    char shown[STATEMENT_SIZE];
+    fill_words(shown, select.shown, values);
+    return db_prepare_bound(handle, select.run, shown, values);
 }
 
-int prepare_select(sqlite_handle* handle, const char* format, const value_list& values)
+template <size_t N>
+int run_statement(sqlite_handle* handle, const statement<N>& change, statement_values<N> values)
 {
-    char sql[STATEMENT_SIZE];
-    build_statement(sql, format, nullptr);
-    return db_prepare_bound(handle, sql, bound_values(values));
+    char shown[STATEMENT_SIZE];
+    fill_words(shown, change.shown, values);
+    log_info("sql = \n%s\n", shown);
+    return db_exec_bound(handle, change.run, values);
 }
 
-int run_statement(sqlite_handle* handle, const char* format, const value_list& values)
+template <size_t N>
+int run_update(sqlite_handle* handle, const statement<N>& update, statement_values<N> values)
 {
-    char sql[STATEMENT_SIZE];
-    build_statement(sql, format, &values);
-    log_info("sql = \n%s\n", sql);
-    build_statement(sql, format, nullptr);
-    return db_exec_bound(handle, sql, bound_values(values));
-}
-
-int run_update(sqlite_handle* handle, const char* format, const value_list& values)
-{
-    if (run_statement(handle, format, values) != 0) {
+    if (run_statement(handle, update, values) != 0) {
         log_err("err!\n");
         return 1;
     }
@@ -154,11 +150,11 @@ int update_stored(const disk_db_record* record,
         return 0;
     }
     const int stored = disk_table_uid_exists(record->uid, &db.handle);
-    if (stored < 0) {
+    if (stored == STORED_UNKNOWN) {
         log_err("err!\n");
         return 0;
     }
-    if (stored == 0) {
+    if (stored == STORED_NOT_ONCE) {
         log_warn("uid not exist\n");
         return 0;
     }
@@ -175,12 +171,13 @@ bool is_complete(const disk_db_record* record)
 
 int disk_table_create(sqlite_handle* handle)
 {
-    if (db_table_exists(handle, TABLE) == 0) {
+    if (db_table_exists(handle, TABLE) == TABLE_EXISTS) {
+        // Logged on every operation of the daemon's: the table is there ever after the first.
         log_warn("db table already exist, table = %s\n", TABLE);
         return 0;
     }
     char sql[STATEMENT_SIZE];
-    build_statement(sql, CREATE_TABLE, nullptr);
+    text_format(sql, sizeof(sql), CREATE_TABLE, TABLE);
     log_info("len = %d, sql = \n%s\n", static_cast<int>(strlen(sql)), sql);
     if (db_exec(handle, sql) != 0) {
         log_err("err!\n");
@@ -193,13 +190,21 @@ int disk_table_uid_exists(const char* uid, sqlite_handle* handle)
 {
     if (uid == nullptr || handle == nullptr) {
         log_err("err!\n");
-        return -1;
+        return STORED_UNKNOWN;
     }
-    if (prepare_select(handle, COUNT_UID, {{uid}, 1}) != 0) {
+    if (prepare_select(handle, COUNT_UID, {uid}) != 0) {
         log_err("err!\n");
-        return -1;
+        return STORED_UNKNOWN;
     }
-    return db_step_is_one(handle);
+    switch (db_step_is_one(handle)) {
+        case ONE_IS:
+            return STORED_ONCE;
+        case ONE_NOT:
+            return STORED_NOT_ONCE;
+        case ONE_UNKNOWN:
+            break;
+    }
+    return STORED_UNKNOWN;
 }
 
 int disk_table_select(const char* uid, disk_db_record* record, sqlite_handle* handle)
@@ -208,25 +213,23 @@ int disk_table_select(const char* uid, disk_db_record* record, sqlite_handle* ha
         log_err("err!\n");
         return 1;
     }
-    if (prepare_select(handle, SELECT_UID, {{uid}, 1}) != 0) {
+    if (prepare_select(handle, SELECT_UID, {uid}) != 0) {
         log_err("err!\n");
         return -1;
     }
+    const statement_guard statement(handle);
     const int code = sqlite3_step(handle->stmt);
     if (code != SQLITE_ROW && code != SQLITE_DONE) {
         log_err("err code = %d\n", code);
         db_log_error(handle);
-        db_finalize(handle);
         return 1;
     }
-    const bool complete = code == SQLITE_ROW && copy_columns(handle, record);
-    if (complete) {
-        disk_db_record_dump(record);
-    } else {
+    if (code == SQLITE_DONE || !copy_columns(handle, record)) {
         log_err("err!\n");
+        return 1;
     }
-    db_finalize(handle);
-    return complete ? 0 : 1;
+    disk_db_record_dump(record);
+    return 0;
 }
 
 int disk_table_set_mountd(const disk_db_record* record, sqlite_handle* handle)
@@ -235,7 +238,7 @@ int disk_table_set_mountd(const disk_db_record* record, sqlite_handle* handle)
         log_err("err!\n");
         return 1;
     }
-    return run_update(handle, UPDATE_MOUNTD, {{mountd_text(record->mountd), record->uid}, 2});
+    return run_update(handle, UPDATE_MOUNTD, {mountd_text(record->mountd), record->uid});
 }
 
 int disk_table_update_paths(const disk_db_record* record, sqlite_handle* handle)
@@ -245,7 +248,7 @@ int disk_table_update_paths(const disk_db_record* record, sqlite_handle* handle)
         return 1;
     }
     return run_update(handle, UPDATE_PATHS,
-                      {{record->dev_name, record->disk_name, record->mount_path, record->uid}, 4});
+                      {record->dev_name, record->disk_name, record->mount_path, record->uid});
 }
 
 int disk_table_update_all(const disk_db_record* record, sqlite_handle* handle)
@@ -255,9 +258,8 @@ int disk_table_update_all(const disk_db_record* record, sqlite_handle* handle)
         return 1;
     }
     return run_update(handle, UPDATE_ALL,
-                      {{record->dev_name, record->disk_name, record->mount_path,
-                        mountd_text(record->mountd), record->uid},
-                       5});
+                      {record->dev_name, record->disk_name, record->mount_path,
+                       mountd_text(record->mountd), record->uid});
 }
 
 void disk_db_add(const disk_db_record* record)
@@ -272,15 +274,15 @@ void disk_db_add(const disk_db_record* record)
         return;
     }
     const int stored = disk_table_uid_exists(record->uid, &db.handle);
-    if (stored < 0) {
+    if (stored == STORED_UNKNOWN) {
         log_err("err!\n");
         return;
     }
-    if (stored == 0) {
+    if (stored == STORED_NOT_ONCE) {
+        // When it fails the log has it, and the mount goes on without its row.
         run_statement(&db.handle, INSERT,
-                      {{record->uid, record->dev_name, record->disk_name, record->mount_path,
-                        record->mountd != 0 ? "yes" : "no"},
-                       5});
+                      {record->uid, record->dev_name, record->disk_name, record->mount_path,
+                       record->mountd != 0 ? "yes" : "no"});
     }
 }
 
@@ -311,6 +313,9 @@ int disk_db_update_all(const disk_db_record* record)
 
 void disk_db_record_dump(const disk_db_record* record)
 {
+    if (record == nullptr) {
+        return;
+    }
     log_info("disk info:\n");
     log_info("uid = %s\n", record->uid);
     log_info("dev name = %s\n", record->dev_name);

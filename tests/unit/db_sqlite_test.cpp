@@ -310,7 +310,8 @@ TEST_F(Database, TextIsBoundAndTakenAsItStands)
     const char* const hostile[] = {"it's; drop table disk"};
     EXPECT_EQ(db_exec_bound(&handle, "insert into disk (id, uuid) values (1, ?)", hostile), 0);
     EXPECT_EQ(handle.stmt, nullptr);
-    ASSERT_EQ(db_prepare_bound(&handle, "select count(*) from disk where uuid = ?", hostile), 0);
+    const char* const sql = "select count(*) from disk where uuid = ?";
+    ASSERT_EQ(db_prepare_bound(&handle, sql, sql, hostile), 0);
     EXPECT_EQ(db_step_is_one(&handle), 1);
 }
 
@@ -318,7 +319,8 @@ TEST_F(Database, AParameterThatDoesNotExistCannotBeBound)
 {
     open_with_table();
     const char* const values[] = {"x"};
-    std::string log = log_of([&] { EXPECT_EQ(db_prepare_bound(&handle, "select 1", values), 1); });
+    std::string log =
+        log_of([&] { EXPECT_EQ(db_prepare_bound(&handle, "select 1", "select x", values), 1); });
     EXPECT_TRUE(contains(log, ERR + "err code = 25\n")) << log;
     EXPECT_EQ(handle.stmt, nullptr);
 
@@ -336,6 +338,28 @@ TEST_F(Database, ABoundStatementThatCannotBePreparedIsToldLikeAnyThatIsExecuted)
     EXPECT_EQ(log, ERR + "err str = no such column: absent\n" + INFO + "sqlite err code = 1\n" +
                        INFO + "sqlite err = no such column: absent\n");
     EXPECT_EQ(handle.stmt, nullptr);
+}
+
+TEST_F(Database, AFailedPreparationIsToldInTheReadableForm)
+{
+    open_with_table();
+    const char* const values[] = {"x"};
+    std::string log = log_of([&] {
+        EXPECT_EQ(db_prepare_bound(&handle, "select absent from disk where uuid = ?",
+                                   "select absent from disk where uuid = 'x'", values),
+                  1);
+    });
+    EXPECT_TRUE(contains(log, ERR + "sq = select absent from disk where uuid = 'x'\n")) << log;
+    EXPECT_EQ(handle.stmt, nullptr);
+    log = log_of([&] { EXPECT_EQ(db_prepare_bound(&handle, "select 1", nullptr, {}), 1); });
+    EXPECT_EQ(log, ERR + "err!\n");
+}
+
+TEST_F(Database, TheErrorOfNoHandleIsNotAsked)
+{
+    EXPECT_EQ(log_of([] { db_log_error(nullptr); }), "");
+    const std::string log = log_of([&] { db_log_error(&handle); });
+    EXPECT_TRUE(contains(log, "sqlite err code = ")) << log;
 }
 
 TEST_F(Database, OnlyTheLastValueOfTheLastRowIsComparedWithOne)

@@ -125,6 +125,25 @@ TEST_F(DiskDb, a_row_that_is_read_fills_the_record_and_is_dumped)
     }
 }
 
+TEST_F(DiskDb, no_record_is_dumped_as_nothing)
+{
+    EXPECT_EQ(support::log_of([] { disk_db_record_dump(nullptr); }), "");
+}
+
+TEST_F(DiskDb, a_question_that_cannot_be_asked_is_logged_with_its_uid)
+{
+    sqlite_handle handle{};
+    ASSERT_EQ(db_open(&handle, ":memory:"), 0);
+    disk_db_record record{};
+    const std::string log = capture_stdout([&] {
+        EXPECT_EQ(disk_table_uid_exists("U-'1", &handle), STORED_UNKNOWN);
+        EXPECT_EQ(disk_table_select("U-'1", &record, &handle), -1);
+    });
+    EXPECT_TRUE(contains(log, "sq = select count(*) from disk where uid='U-'1'\n")) << log;
+    EXPECT_TRUE(contains(log, "sq = select * from disk where uid='U-'1'\n")) << log;
+    db_close(&handle);
+}
+
 TEST_F(DiskDb, an_unmount_keeps_the_row_and_writes_no)
 {
     add_row("U-1", "sda1", "disk1_part1");
