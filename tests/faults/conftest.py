@@ -1,27 +1,13 @@
-"""Fixtures of the tests with faults: those of the system tests, the long form, and the count."""
+"""Fixtures of the tests with faults: what they preload, two disks to try them on, and the count."""
 
-import sys
 from collections import Counter
-from pathlib import Path
-
-HERE = Path(__file__).resolve().parent
-sys.path[:0] = [str(HERE), str(HERE.parent), str(HERE.parent / "system")]
 
 import pytest
-
-import preload
-from rig import Rig
-from system.conftest import (  # noqa: F401
-    make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
-    pytest_runtest_setup, start_daemon, world)
+from faults.rig import Rig
+from shared import preload
 
 _INJECTED = "injected"
 _OUTCOME = "outcome"
-
-
-def pytest_addoption(parser):
-    parser.addoption("--long", action="store_true",
-                     help="every occurrence of every call and allocation; takes an hour")
 
 
 def pytest_terminal_summary(terminalreporter):
@@ -38,12 +24,6 @@ def pytest_terminal_summary(terminalreporter):
             terminalreporter.section(title)
             for what, times in [*sorted(totals.items()), ("in all", totals.total())]:
                 terminalreporter.write_line(f"{what:44} {times:7}")
-
-
-@pytest.fixture
-def long_form(request):
-    """True when everything is wanted."""
-    return request.config.getoption("--long")
 
 
 @pytest.fixture
@@ -69,6 +49,6 @@ def libraries(tmp_path_factory):
 
 
 @pytest.fixture
-def rig(world, start_daemon, libraries):  # noqa: F811
+def rig(world, start_daemon, libraries):
     """Two disks mounted, published and remembered, the first rescan over; a hastened daemon."""
     return Rig(world, environ=preload.install(world, libraries, "haste"))

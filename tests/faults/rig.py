@@ -3,8 +3,8 @@
 import time
 from pathlib import Path
 
-from moments import quiet_moment
-from preload import HASTE
+from shared.moments import quiet_moment
+from shared.preload import HASTE
 
 from world import DaemonGone, Partition, WaitTimeout, add_messages
 

@@ -3,8 +3,8 @@
 import contextlib
 from collections import Counter
 
-from calls import names_in
-from strace import Strace
+from faults.calls import names_in
+from shared.strace import Strace
 
 from world import Partition, WaitTimeout
 from world.state import DISK_DB, PID_FILE

@@ -1,11 +1,11 @@
 """Every allocation in SQLite, in cJSON and of the daemon itself fails."""
 
 import pytest
-from allocations import CJSON, OWN, SQLITE, Allocations
-from preload import install
-from rig import Rig
-from starting import Starts
-from strace import Strace
+from shared.allocations import CJSON, OWN, SQLITE, Allocations
+from shared.preload import install
+from faults.rig import Rig
+from faults.starting import Starts
+from shared.strace import Strace
 
 from world import Partition
 from world.state import DISK_DB, SCRATCH

@@ -6,9 +6,9 @@ import time
 from contextlib import suppress
 
 import pytest
-from calls import known_names, names_in, of_stage, parametrize
-from preload import HASTE
-from strace import Strace
+from faults.calls import known_names, names_in, of_stage, parametrize
+from shared.preload import HASTE
+from shared.strace import Strace
 
 from world import WaitTimeout
 from world.state import SCRATCH

@@ -1,9 +1,9 @@
 """Every system call of a starting daemon fails, one at a time."""
 
-import preload
+from shared import preload
 import pytest
-from calls import known_names, of_stage, parametrize
-from starting import Starts
+from faults.calls import known_names, of_stage, parametrize
+from faults.starting import Starts
 
 pytestmark = pytest.mark.needs_fs("ext4")
 

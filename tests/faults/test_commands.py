@@ -1,9 +1,9 @@
 """Commands that are killed, and a shell that is not there."""
 
 import pytest
-from preload import install
-from rig import Rig
-from starting import Starts
+from shared.preload import install
+from faults.rig import Rig
+from faults.starting import Starts
 
 from world.state import PID_FILE
 

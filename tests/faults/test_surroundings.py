@@ -3,9 +3,9 @@
 import os
 
 import pytest
-from preload import HASTE, install
-from starting import Starts
-from strace import Strace
+from shared.preload import HASTE, install
+from faults.starting import Starts
+from shared.strace import Strace
 
 from world import Partition
 from world.state import DISK_DB, DISK_JSON, PID_FILE

@@ -1,19 +1,12 @@
-"""Fixtures of the runs under valgrind: the system tests' world, and valgrind's command line."""
+"""Fixtures of the runs under valgrind: its command line, and the programs of the debug preset."""
 
 import shutil
-import sys
-from pathlib import Path
 
 import pytest
 
-CHECKOUT = Path(__file__).resolve().parents[2]
+from world import CHECKOUT
+
 DEBUG = CHECKOUT / "build/debug"
-sys.path[:0] = [str(CHECKOUT / "tests"), str(CHECKOUT / "tests/system")]
-
-from system.conftest import (  # noqa: F401
-    make_world, pytest_configure, pytest_report_header, pytest_runtest_makereport,
-    pytest_runtest_setup)
-
 # What is still reachable at the end is static data of libraries, which they never give back.
 _OPTIONS = ["--error-exitcode=9", "--leak-check=full", "--vgdb=no",
             "--show-leak-kinds=definite,indirect,possible",

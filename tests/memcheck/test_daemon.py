@@ -4,7 +4,7 @@ import re
 import signal
 
 import pytest
-from moments import quiet_moment
+from shared.moments import quiet_moment
 
 from world import Partition
 

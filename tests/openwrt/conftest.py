@@ -2,23 +2,12 @@
 
 import os
 import subprocess
-import sys
 from pathlib import Path
 
 import pytest
+from openwrt.router import HERE, PACKAGE, Buildroot, Router
 
-HERE = Path(__file__).resolve().parent
-sys.path[:0] = [str(HERE), str(HERE.parent)]
-
-from router import PACKAGE, Buildroot, Router
-from world import missing
 from world.world import PROGRAM
-
-
-def pytest_runtest_setup():
-    lacks = missing()
-    if lacks:
-        pytest.skip("no private world: " + "; ".join(lacks))
 
 
 @pytest.fixture(scope="session")
@@ -31,18 +20,13 @@ def stand_in(tmp_path_factory):
 
 
 @pytest.fixture
-def make_router(tmp_path):
+def make_router(make_world, tmp_path):
     """Function that installs the package around a given daemon on a fresh router."""
-    routers = []
-
     def make(program):
-        buildroot = Buildroot(tmp_path / f"buildroot-{len(routers)}", program)
-        routers.append(Router(buildroot.install(PACKAGE, f"{PACKAGE}-label")))
-        return routers[-1]
-
-    yield make
-    for router in routers:
-        router.close()
+        buildroot = Buildroot(tmp_path / "buildroot", program)
+        return Router(make_world(tools="busybox"),
+                      buildroot.install(PACKAGE, f"{PACKAGE}-label"))
+    return make
 
 
 @pytest.fixture

@@ -4,18 +4,15 @@ import shutil
 import subprocess
 from pathlib import Path
 
-from world import World, wait_for
+from world import CHECKOUT, wait_for
+from world.events import PIPES
 
 HERE = Path(__file__).resolve().parent
-CHECKOUT = HERE.parents[1]
 PACKAGE = "tarn-nas-diskmanager"
 FEED_DIR = CHECKOUT / "openwrt" / PACKAGE
 INIT = "/etc/init.d/tarn_nas_diskmanager"
 HOTPLUG = "/etc/hotplug.d/block/60-tarn_nas_diskmanager"
-LABEL = "/usr/bin/disk_get_label.sh"
 PROG = "/usr/bin/tarn_nas_diskmanager"
-PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
-PIPE = "/tmp/tarn_nas/pipe_disk_add_remove"
 
 
 class Buildroot:
@@ -57,8 +54,8 @@ class Buildroot:
 class Router:
     """A world on which the staged package lies and the scripts run under busybox ash."""
 
-    def __init__(self, root):
-        self.world = World(tools="busybox")
+    def __init__(self, world, root):
+        self.world = world
         # Both directories are the machine's own until an overlay covers them.
         self.world.label_script("")
         self._overlay("/usr/lib")
@@ -80,9 +77,6 @@ class Router:
         self.world.run("mount", "-t", "overlay", "overlay", directory, "-o",
                        f"lowerdir={directory},upperdir={upper}/upper,workdir={upper}/work")
 
-    def close(self):
-        self.world.close()
-
     # The service.
 
     def service(self, action, timeout=100):
@@ -98,7 +92,7 @@ class Router:
         """Wait for a daemon that is none of `but` and has opened its pipe; returns its pid."""
         def ready():
             pids = [pid for pid in self.pids() if pid not in but]
-            return pids and any(PIPE in line for line in self.open_files(pids[0])) and pids[0]
+            return pids and any(PIPES["add_remove"] in line for line in self.open_files(pids[0])) and pids[0]
         return wait_for(ready, 20, "a daemon with an open pipe")
 
     def pids(self):

@@ -4,8 +4,11 @@ import os
 import time
 
 import pytest
-from router import PID_FILE, PIPE
-from world import Partition, wait_for
+
+from world import PIPES, Partition, wait_for
+from world.state import PID_FILE
+
+PIPE = PIPES["add_remove"]
 
 ACCEPTED = ["sda", "sda1", "sdab12", "hdc", "mmcblk0", "mmcblk0p1", "mmcblk12p3", "s" + "d" + "x" * 29]
 REFUSED = ["sd", "hd", "sr0", "loop0", "ram1", "mtdblock3", "nvme0n1", "dm-0", "zram0", "mmc0", "",

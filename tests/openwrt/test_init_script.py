@@ -4,8 +4,10 @@ import re
 import time
 
 import pytest
-from router import INIT, PID_FILE, PROG
+from openwrt.router import INIT, PROG
+
 from world import wait_for
+from world.state import PID_FILE
 
 
 def starts(router):

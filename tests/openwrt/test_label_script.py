@@ -3,15 +3,16 @@
 import json
 
 import pytest
-from router import LABEL
+
 from world import Partition, wait_for
+from world.tools import LABEL_SCRIPT
 
 
 @pytest.fixture
 def label(router):
     """Function that asks the script for the label of a device."""
     def ask(name):
-        return router.world.run(LABEL, name, check=False).stdout
+        return router.world.run(LABEL_SCRIPT, name, check=False).stdout
     return ask
 
 
@@ -65,7 +66,7 @@ def test_a_blkid_that_knows_no_options_is_understood(router, label, line, text):
 @pytest.mark.parametrize("name", ["", "sda;id", "../sda", "sda 1", "$(id)", "-h", "nosuch1"])
 def test_a_name_that_is_no_device_is_refused_before_blkid_runs(router, name):
     router.world.tools.stub("blkid", "echo called >/tmp/called\n")
-    done = router.world.run(LABEL, name, check=False)
+    done = router.world.run(LABEL_SCRIPT, name, check=False)
     assert done.returncode != 0
     assert done.stdout == ""
     assert not router.world.exists("/tmp/called")

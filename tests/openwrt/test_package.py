@@ -4,7 +4,9 @@ import os
 import subprocess
 
 import pytest
-from router import CHECKOUT, FEED_DIR, PACKAGE
+from openwrt.router import FEED_DIR, PACKAGE
+
+from world import CHECKOUT
 
 EXECUTABLE = ["etc/init.d/tarn_nas_diskmanager", "usr/bin/disk_get_label.sh",
               "usr/bin/tarn_nas_diskmanager"]

@@ -7,16 +7,15 @@ import threading
 import time
 import uuid
 
-from file_events import FileEvents
-from published import objections
+from shared.file_events import FileEvents
+from shared.published import objections
 
-from world import DaemonGone, Partition, WaitTimeout, state
+from world import PIPES, DaemonGone, Partition, WaitTimeout, state
 from world.state import DB_JOURNAL, DISK_DB, DISK_JSON, PID_FILE
 
 KERNEL_NAMES = ["sda", "sdb", "sdc", "sdd", "sde"]
 # Those of a cycle and that of the start.
 SCRATCH = [*state.SCRATCH, "/tmp/disk_pid_tmp"]
-PIPES = [f"/tmp/tarn_nas/pipe_disk_{name}" for name in ("add_remove", "safe_remove", "remove")]
 # Instants to kill at: a file of the daemon's and at most how many of its events to let pass.
 DATABASE_INSTANTS = [("/etc/config/tarn_nas", "disk.db-journal", 24),
                      ("/etc/config/tarn_nas", "disk.db-journal", 4),
@@ -121,7 +120,7 @@ class StormyRouter:
         world.wait(lambda: not self._used_scratch(), 10,
                    lambda: f"the end of {self._used_scratch()}")
         assert world.read(PID_FILE) == str(self.daemon.pid)
-        assert all(world.path(pipe).is_fifo() for pipe in PIPES)
+        assert all(world.path(pipe).is_fifo() for pipe in PIPES.values())
         self.check_rows()
         known = {row["uid"] for row in world.db_rows()}
         assert known >= self._plugged_uids()

@@ -3,7 +3,7 @@
 from collections import Counter
 
 import pytest
-from stormy_router import StormyRouter
+from storm.stormy_router import StormyRouter
 
 pytestmark = pytest.mark.needs_fs("ext4")
 
@@ -13,7 +13,7 @@ KILLS = {"short": 5, "long": 40}
 
 @pytest.mark.parametrize("number", range(WORLDS))
 def test_whatever_instant_it_is_killed_at_the_next_run_puts_everything_right(
-        make_world, request, is_long, figure, number):
+        make_world, request, long_form, figure, number):
     seed = request.config.getoption("--seed") or 20_000 + number
     figure("seed", seed)
     world = make_world()
@@ -32,7 +32,7 @@ def test_whatever_instant_it_is_killed_at_the_next_run_puts_everything_right(
         if router.random.random() < 0.5:
             router.shuffle()
         router.start_and_settle()
-        if moments.total() >= KILLS["long" if is_long else "short"]:
+        if moments.total() >= KILLS["long" if long_form else "short"]:
             break
         at_start = router.random.random() < 0.5
         if at_start:

@@ -11,8 +11,8 @@ from collections import Counter
 from pathlib import Path
 
 import pytest
-from moments import quiet_moment
-from whole_lines import broken_lines, is_announcement, is_foreign
+from shared.moments import quiet_moment
+from shared.whole_lines import broken_lines, is_announcement, is_foreign
 
 from world import WaitTimeout, wait_for
 
@@ -197,7 +197,7 @@ def check_log(log, sent, syslog, figure):
 
 @pytest.mark.parametrize("number", range(1))
 def test_a_storm_of_signals_neither_stops_nor_garbles_anything(
-        make_world, request, is_long, figure, number):
+        make_world, request, long_form, figure, number):
     seed = request.config.getoption("--seed") or 30_000 + number
     figure("seed", seed)
     world = make_router(make_world)
@@ -206,7 +206,7 @@ def test_a_storm_of_signals_neither_stops_nor_garbles_anything(
     assert int(mask, 16) >> (BLOCKED - 1) & 1
     wait_handlers(world, daemon)
 
-    sent = storm_over(world, daemon, SIGNALS["long" if is_long else "short"], seed, figure)
+    sent = storm_over(world, daemon, SIGNALS["long" if long_form else "short"], seed, figure)
     check_disks(world, daemon)
     send_sigint_until_told(daemon, 2)
     assert daemon.wait_exit(60) == 0

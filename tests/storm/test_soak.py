@@ -6,9 +6,9 @@ import time
 from collections import Counter
 
 import pytest
-from footprint import Footprint
-from moments import quiet_moment
-from stormy_router import SCRATCH
+from shared.footprint import Footprint
+from shared.moments import quiet_moment
+from storm.stormy_router import SCRATCH
 
 from world import Partition
 from world.built import RELEASE, STATIC, why_not
@@ -112,7 +112,7 @@ def leftovers(world):
 
 @pytest.mark.parametrize(("program", "number"), PROGRAMS)
 def test_neither_memory_nor_descriptors_grow_with_the_events(
-        make_world, request, is_long, figure, program, number):
+        make_world, request, long_form, figure, program, number):
     if reason := why_not(program):
         pytest.skip(reason)
     seed = request.config.getoption("--seed") or 40_000 + number
@@ -122,7 +122,7 @@ def test_neither_memory_nor_descriptors_grow_with_the_events(
     rounds = Rounds(world, daemon, seed)
     rounds.one_of_each()
     before, samples = leftovers(world), []
-    while rounds.events().total() < EVENTS["long" if is_long else "short"]:
+    while rounds.events().total() < EVENTS["long" if long_form else "short"]:
         rounds.one()
         samples.append(Footprint.of(daemon.outer_pid))
     taken = rounds.events()
@@ -152,7 +152,7 @@ def bytes_an_hour(daemon, cycles):
     return round((daemon.mark() - mark) / (time.monotonic() - begun) * 3600)
 
 
-def test_the_log_of_an_idle_daemon_has_a_known_volume(make_world, is_long, figure):
+def test_the_log_of_an_idle_daemon_has_a_known_volume(make_world, long_form, figure):
     world = make_world()
     if not world.program.exists():
         pytest.skip(f"{world.program} is not built")
@@ -162,6 +162,6 @@ def test_the_log_of_an_idle_daemon_has_a_known_volume(make_world, is_long, figur
     world.wait(lambda: "sda1" in world.parts(), 40, "sda1 in disk.json")
     # From 30 s after the last change on, the status files are written in each cycle.
     daemon.wait_idle_cycles(11)
-    volume = bytes_an_hour(daemon, 80 if is_long else 8)
+    volume = bytes_an_hour(daemon, 80 if long_form else 8)
     figure("log of an hour with one mounted disk, bytes", volume)
     assert 100_000 < volume < 4_000_000

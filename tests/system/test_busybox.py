@@ -7,7 +7,7 @@ import os
 from pathlib import Path
 
 import pytest
-from moments import quiet_moment
+from shared.moments import quiet_moment
 
 from world import Partition, kernel_has
 from world.built import RELEASE, STATIC, outdated, why_not

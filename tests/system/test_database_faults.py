@@ -4,7 +4,7 @@ import subprocess
 import sys
 
 import pytest
-from moments import quiet_moment
+from shared.moments import quiet_moment
 
 from world import Partition
 from world.state import DISK_DB

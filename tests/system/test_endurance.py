@@ -3,7 +3,7 @@
 from pathlib import Path
 
 import pytest
-from moments import quiet_moment
+from shared.moments import quiet_moment
 
 from world import Partition
 

@@ -1,7 +1,7 @@
 """Tables, filesystems and labels, as the distribution's own tools make and read them."""
 
 import pytest
-from published import wait_directories, wait_mounted
+from shared.published import wait_directories, wait_mounted
 
 from world import Partition
 

@@ -1,8 +1,8 @@
 """Disks and partitions that arrive while the daemon runs, announced or only found."""
 
 import pytest
-from moments import quiet_moment
-from published import directories, wait_directories, wait_mounted
+from shared.moments import quiet_moment
+from shared.published import directories, wait_directories, wait_mounted
 
 from world import Partition
 

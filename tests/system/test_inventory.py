@@ -3,7 +3,7 @@
 import json
 
 import pytest
-from published import directories, wait_directories, wait_mounted
+from shared.published import directories, wait_directories, wait_mounted
 
 from world import Partition
 from world.state import DISK_JSON, DISK_NUM

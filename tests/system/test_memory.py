@@ -1,8 +1,8 @@
 """Remembered directories: what the database holds and when it wins."""
 
 import pytest
-from moments import first_rescan_over, quiet_moment
-from published import directories, wait_directories, wait_mounted
+from shared.moments import first_rescan_over, quiet_moment
+from shared.published import directories, wait_directories, wait_mounted
 
 from world import Partition
 

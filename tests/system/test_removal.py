@@ -1,8 +1,8 @@
 """Removal of partitions and disks, by event, by pulling and all at once."""
 
 import pytest
-from moments import first_rescan_over, quiet_moment
-from published import directories, wait_directories, wait_mounted
+from shared.moments import first_rescan_over, quiet_moment
+from shared.published import directories, wait_directories, wait_mounted
 
 from world import Partition
 

@@ -4,7 +4,7 @@ import contextlib
 import os
 
 import pytest
-from published import wait_mounted
+from shared.published import wait_mounted
 
 from world import Partition
 

@@ -12,12 +12,11 @@ from pathlib import Path
 
 import pytest
 
-from world import Partition
+from world import PIPES, Partition
 from world.daemon import Daemon
 from world.state import DISK_JSON, PID_FILE
 
 DAEMON_INFO = 3 * 8 + 6
-EVENT_PIPES = [f"/tmp/tarn_nas/pipe_disk_{name}" for name in ("add_remove", "safe_remove", "remove")]
 
 
 def test_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cycle(world, daemon):
@@ -47,7 +46,7 @@ def test_end_by_sigint_leaves_mounts_status_files_and_pipes_in_place(world, star
     assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
     assert world.read(DISK_JSON) == published
     assert world.db_rows()[0]["mountd"] == "yes"
-    assert all(world.path(pipe).is_fifo() for pipe in EVENT_PIPES)
+    assert all(world.path(pipe).is_fifo() for pipe in PIPES.values())
     assert not world.exists(PID_FILE)
     assert world.tools.service_calls() == []
 
@@ -142,7 +141,7 @@ def cpu_seconds(daemon):
 
 def unread_bytes(world):
     """What waits in the add/remove pipe."""
-    pipe = os.open(world.path(EVENT_PIPES[0]), os.O_WRONLY | os.O_NONBLOCK)
+    pipe = os.open(world.path(PIPES["add_remove"]), os.O_WRONLY | os.O_NONBLOCK)
     try:
         return int.from_bytes(fcntl.ioctl(pipe, termios.FIONREAD, bytes(4)), sys.byteorder)
     finally:

@@ -4,7 +4,8 @@ import re
 
 import pytest
 
-PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
+from world.state import PID_FILE
+
 HOOK = "/etc/hotplug.d/block/10-mount"
 EMPTY_DOCUMENT = '{"disk_number": 0, "disk": []}'
 

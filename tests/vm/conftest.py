@@ -6,9 +6,11 @@ from pathlib import Path
 
 import pytest
 
-from daemon import BINARY, Daemon, pack_daemon
-from disks import DiskBox
-from vm import Vm, VmError
+from vm.daemon import Daemon, pack_daemon
+from vm.disks import DiskBox
+from vm.vm import Vm, VmError
+
+from world.built import RELEASE
 
 HERE = Path(__file__).resolve().parent
 UNAVAILABLE = 69
@@ -46,8 +48,8 @@ def bare_vm(machine_files):
 @pytest.fixture(scope="session")
 def daemon_vm(machine_files, tmp_path_factory):
     """One machine with the release daemon in it for all tests; `daemon` cleans it up between them."""
-    if not BINARY.exists():
-        pytest.skip(f"no daemon: {BINARY} is not built")
+    if not RELEASE.exists():
+        pytest.skip(f"no daemon: {RELEASE} is not built")
 
     overlay = tmp_path_factory.mktemp("vm") / "daemon.cpio"
     pack_daemon(overlay)

@@ -9,19 +9,17 @@ import time
 from contextlib import contextmanager
 from pathlib import Path
 
-from vm import ROOT, VmError
+from vm.vm import VmError
 
-BINARY = ROOT / "build" / "release" / "tarn_nas_diskmanager"
-PACKAGE = ROOT / "openwrt" / "tarn-nas-diskmanager" / "files"
+from world import CHECKOUT, PIPES
+from world.built import RELEASE
+from world.state import DISK_JSON, MOUNT_BASE, PID_FILE
+
+PACKAGE = CHECKOUT / "openwrt" / "tarn-nas-diskmanager" / "files"
 LIBRARIES = "lib/x86_64-linux-gnu"
 HOTPLUG = "etc/hotplug.d/block/60-tarn_nas_diskmanager"
 
-STATUS = "/tmp/tarn_nas/disk.json"
-COUNT = "/tmp/tarn_nas/disk_num.txt"
-PIPE = "/tmp/tarn_nas/pipe_disk_add_remove"
-PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
-DATABASE = "/etc/config/tarn_nas/disk.db"
-MOUNTS = "/tmp/mountd"
+PIPE = PIPES["add_remove"]
 
 REMOVED_DISK = "^remove \\(sd[a-z]*\\|mmcblk[0-9]*\\)$"
 
@@ -39,12 +37,12 @@ def pack_daemon(archive):
         (root / "bin").mkdir()
         (root / LIBRARIES).mkdir(parents=True)
         (root / HOTPLUG).parent.mkdir(parents=True)
-        shutil.copy2(BINARY, root / "bin" / BINARY.name)
+        shutil.copy2(RELEASE, root / "bin" / RELEASE.name)
         shutil.copy2(PACKAGE / "tarn_nas_diskmanager.hotplug", root / HOTPLUG)
         shutil.copy2(PACKAGE / "disk_get_label.sh", root / "bin" / "disk_get_label.sh")
         (root / "bin" / "disk_get_label.sh").chmod(0o755)
 
-        listed = subprocess.run(["ldd", BINARY], capture_output=True, text=True, check=True).stdout
+        listed = subprocess.run(["ldd", RELEASE], capture_output=True, text=True, check=True).stdout
 
         for library in re.findall(r"=> (/\S+)", listed):
             shutil.copy2(library, root / LIBRARIES / Path(library).name)
@@ -113,7 +111,7 @@ class Daemon:
     def status(self):
         """The published document, or None while it is being written."""
         try:
-            return json.loads(self.vm.run(f"cat {STATUS}").output)
+            return json.loads(self.vm.run(f"cat {DISK_JSON}").output)
         except ValueError:
             return None
 
@@ -133,8 +131,8 @@ class Daemon:
         for line in self.vm.check("cat /proc/mounts").splitlines():
             device, path, kind = line.split()[:3]
 
-            if path.startswith(MOUNTS + "/"):
-                found[path[len(MOUNTS) + 1:]] = (device, kind)
+            if path.startswith(MOUNT_BASE + "/"):
+                found[path[len(MOUNT_BASE) + 1:]] = (device, kind)
 
         return found
 
@@ -162,6 +160,6 @@ class Daemon:
         self.vm.run("kill -9 $(pidof start_daemon tarn_nas_diskmanager tarn_nas_sys) 2>/dev/null")
         self.vm.pull_everything()
         self.vm.wait("! ls /sys/block | grep -q -e '^sd' -e '^mmcblk'")
-        self.vm.check(f"for path in $(cut -d ' ' -f 2 /proc/mounts | grep '^{MOUNTS}/'); do umount $path; done")
-        self.vm.wait(f"! grep -q '{MOUNTS}/' /proc/mounts")
+        self.vm.check(f"for path in $(cut -d ' ' -f 2 /proc/mounts | grep '^{MOUNT_BASE}/'); do umount $path; done")
+        self.vm.wait(f"! grep -q '{MOUNT_BASE}/' /proc/mounts")
         self.vm.check("rm -rf /tmp/* /etc/config/tarn_nas /etc/tarn_utils /run/blkid && mkdir /tmp/log")

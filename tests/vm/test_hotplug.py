@@ -3,15 +3,16 @@
 Disks are told apart by their labels: their device names depend on the order of plugging and on what is still mounted.
 """
 
-import daemon as paths
-from daemon import STARTED, STOPPED
-from disks import Part
+from vm.daemon import SETTLE_LIMIT, STARTED, STOPPED
+from vm.disks import Part
+
+from world.state import DISK_DB, DISK_JSON, DISK_NUM, MOUNT_BASE, PID_FILE
 
 OWNER = 1000
 
 
 def file_in(place):
-    return f"{paths.MOUNTS}/{place}/note"
+    return f"{MOUNT_BASE}/{place}/note"
 
 
 def write_note(vm, place, text):
@@ -24,7 +25,7 @@ def note(vm, place):
 
 def test_without_disks_the_empty_document_is_published(daemon_vm, daemon):
     daemon.start()
-    assert daemon_vm.wait(f"cat {paths.STATUS}") == '{"disk_number": 0, "disk": []}'
+    assert daemon_vm.wait(f"cat {DISK_JSON}") == '{"disk_number": 0, "disk": []}'
 
 
 def test_a_stick_with_fat_and_ext4_is_mounted_and_published(daemon_vm, daemon, box):
@@ -39,7 +40,7 @@ def test_a_stick_with_fat_and_ext4_is_mounted_and_published(daemon_vm, daemon, b
     status = daemon.status()
     assert status["disk_number"] == 1
     assert [(disk["part_num"], disk["sd_card"]) for disk in status["disk"]] == [(2, 0)]
-    assert daemon_vm.check(f"cat {paths.COUNT}") == "1"
+    assert daemon_vm.check(f"cat {DISK_NUM}") == "1"
 
     for label, device, kind, size in (("STICK", "sda1", "FAT", 1200), ("DATA", "sda2", "EXT4", 1100)):
         part = daemon.parts()[label]
@@ -235,11 +236,11 @@ def test_a_restart_keeps_the_directories(daemon_vm, daemon, box):
     write_note(daemon_vm, "disk2_part1", "large")
 
     assert daemon.stop() == 0
-    assert daemon_vm.run(f"[ -e {paths.PID_FILE} ]").status != 0
+    assert daemon_vm.run(f"[ -e {PID_FILE} ]").status != 0
     assert set(daemon.mounts()) == set(places.values()), "the mounts outlive the daemon"
 
     # A fresh start numbers the larger disk first; what is remembered wins.
-    daemon_vm.check(f"rm {paths.STATUS}")
+    daemon_vm.check(f"rm {DISK_JSON}")
     daemon.start()
     daemon.wait_places(places)
     assert note(daemon_vm, "disk2_part1") == "large"
@@ -255,7 +256,7 @@ def test_one_interrupt_is_only_noted(daemon_vm, daemon, box):
     daemon.wait_places({"STICK": "disk1_part1"})
 
     daemon.interrupt()
-    assert int(daemon_vm.wait("cat /tmp/daemon.status", paths.SETTLE_LIMIT)) == 0
+    assert int(daemon_vm.wait("cat /tmp/daemon.status", SETTLE_LIMIT)) == 0
 
 
 def test_after_a_safe_removal_a_stick_plugged_again_returns(daemon_vm, daemon, box):
@@ -283,12 +284,12 @@ def test_a_pulled_stick_that_is_kept_busy_restarts_the_daemon_with_a_fresh_datab
     daemon.start()
     daemon_vm.plug_usb("stick", stick)
     daemon.wait_places({"STICK": "disk1_part1"})
-    holder = daemon_vm.check(f"cd {paths.MOUNTS}/disk1_part1; sleep 600 >/dev/null 2>&1 & echo $!").strip()
+    holder = daemon_vm.check(f"cd {MOUNT_BASE}/disk1_part1; sleep 600 >/dev/null 2>&1 & echo $!").strip()
 
     daemon.pull_usb("stick")
-    daemon_vm.wait("grep -q 'tarn_nas_diskmanager restart' /tmp/services", paths.SETTLE_LIMIT)
-    daemon_vm.wait(f"pidof tarn_nas_diskmanager && [ -s {paths.PID_FILE} ]")
-    assert daemon_vm.run(f"[ -e {paths.DATABASE} ]").status != 0
+    daemon_vm.wait("grep -q 'tarn_nas_diskmanager restart' /tmp/services", SETTLE_LIMIT)
+    daemon_vm.wait(f"pidof tarn_nas_diskmanager && [ -s {PID_FILE} ]")
+    assert daemon_vm.run(f"[ -e {DISK_DB} ]").status != 0
 
     # The old mount keeps its disk number until it goes.
     daemon_vm.plug_usb("stick", stick)

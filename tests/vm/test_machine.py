@@ -3,7 +3,7 @@
 When these fail, the fault is the machine's and not the daemon's.
 """
 
-from disks import Part
+from vm.disks import Part
 
 MOUNTS = """
 set -e

@@ -14,8 +14,9 @@ import tempfile
 import time
 from pathlib import Path
 
-ROOT = Path(__file__).resolve().parents[2]
-BUILD = ROOT / "build" / "vm"
+from world import CHECKOUT
+
+BUILD = CHECKOUT / "build" / "vm"
 KERNEL = BUILD / "vmlinuz"
 INITRAMFS = BUILD / "initramfs.cpio"
 

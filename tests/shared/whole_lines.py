@@ -3,7 +3,7 @@
 import re
 from functools import cache
 
-from world.world import CHECKOUT
+from world import CHECKOUT
 
 _HEADER = r"(?:(?:Warning|ERROR)\[(?P<a>\w+\.cpp):\d+\]|(?P<b>[\w/.]+\.cpp)\(\d+\))"
 _LINE = re.compile(_HEADER + r"(?P<text>.*)")

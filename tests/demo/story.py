@@ -8,11 +8,10 @@ import hashlib
 import os
 import sys
 
-from .disk import Partition
-from .need import kernel_has, missing
-from .shell import Shell
-from .show import Failed, Narrator, mount_listing, table
-from .world import World
+from demo.shell import Shell
+from demo.show import Failed, Narrator, mount_listing, table
+from world import Partition, World, kernel_has, missing
+from world.state import PID_FILE
 
 # A mount takes at least 2 s, a cycle 3 s, and a failed try up to 18 s.
 MOUNT_TIMEOUT = 45
@@ -204,7 +203,7 @@ class Story:
         self.tell.say("   waiting for its end (at most 60 s)")
         self.tell.check("it ended with status 0", self.daemon.stop(60) == 0)
         self.tell.check("its pid file is gone",
-                        not self.world.exists("/tmp/tarn_nas/disk_manager_pid"))
+                        not self.world.exists(PID_FILE))
         self.tell.check("nothing is left mounted", not self.world.mounts())
 
 

@@ -4,7 +4,7 @@ import inspect
 import subprocess
 import sys
 
-from .show import Failed, table
+from demo.show import Failed, table
 
 HELP = """\
   plug NAME [DEVICE]   plug a disk, as the next free sdX (mmcblk0 for the card) or as DEVICE

@@ -2,8 +2,7 @@
 
 import time
 
-from .daemon import DaemonGone
-from .waiting import wait_for
+from world import DaemonGone, wait_for
 
 _HEADINGS = ("DIRECTORY", "DEVICE", "FILESYSTEM", "LABEL", "SIZE", "FREE", "SD CARD", "MOUNTED AS")
 

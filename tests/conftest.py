@@ -1,23 +1,19 @@
-"""Fixtures of the system tests: a world for each test and the daemon in it."""
-
-import sys
-from pathlib import Path
+"""Fixtures of all groups: a world for each test, the daemon in it, the long form, figures."""
 
 import pytest
+from shared.published import StatusWatch
 
-HERE = Path(__file__).resolve().parent
-sys.path[:0] = [str(HERE), str(HERE.parent)]
-
-from published import StatusWatch
 from world import World, kernel_has, missing
 from world.world import PROGRAM
 
 _WORLDS = pytest.StashKey[list]()
 
 
-def pytest_configure(config):
-    config.addinivalue_line(
-        "markers", "needs_fs(name, …): skipped where the kernel cannot mount one of them")
+def pytest_addoption(parser):
+    parser.addoption("--long", action="store_true",
+                     help="the long form of the faults and storms; takes hours")
+    parser.addoption("--seed", type=int, default=None,
+                     help="seed of what is random, printed with the figures of each run")
 
 
 def pytest_report_header():
@@ -45,6 +41,31 @@ def pytest_runtest_makereport(item):
     if report.failed:
         for number, world in enumerate(item.stash.get(_WORLDS, []), 1):
             report.sections.append((f"world {number}", world.diagnosis()))
+
+
+def pytest_terminal_summary(terminalreporter):
+    """The figures of every test, passed or not."""
+    for outcome in ("passed", "failed"):
+        for report in terminalreporter.stats.get(outcome, []):
+            for name, value in report.user_properties:
+                if isinstance(value, str):
+                    terminalreporter.write_line(f"{report.nodeid.split('::')[-1]}: {name}: {value}")
+
+
+@pytest.fixture
+def long_form(request):
+    """True when everything is wanted."""
+    return request.config.getoption("--long")
+
+
+@pytest.fixture
+def figure(record_property):
+    """Function that notes a figure for the summary and for the result file."""
+    def note(name, value):
+        record_property(name, str(value))
+        # Beside a failed test too, where the summary has the whole log above it.
+        print(f"{name}: {value}")
+    return note
 
 
 @pytest.fixture

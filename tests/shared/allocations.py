@@ -5,7 +5,7 @@ import os
 import struct
 from dataclasses import dataclass
 
-from preload import CONTROL
+from shared.preload import CONTROL
 
 SQLITE, CJSON, OWN = 1, 2, 3
 
