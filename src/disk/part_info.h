@@ -4,6 +4,7 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "util/fs_code.h"
 #include "util/paths.h"
 
 // Text sizes, terminating zero included.
@@ -43,7 +44,7 @@ struct part_info {
     // disk_obj_set_ref_root when the disk moves in the table.
     part_info* ref_root;
     // part_info_fill, once.
-    int32_t fs_type;
+    fs_code fs_type;
     // Disk number on a root record: set_all_mount_point_num, or disk_sets_add_disk after it. Part
     // number on a partition: number_sub_parts, in each mount pass.
     int32_t mount_point_num;

@@ -31,10 +31,10 @@ constexpr uint32_t EXT4_FIRST_RO_COMPAT = 8;    // huge files; later features ar
 constexpr size_t HFSPLUS_ATTRIBUTES_OFFSET = 6;
 constexpr uint8_t HFSPLUS_JOURNALED = 0x20;
 
-// A region of the device with the zero byte behind that fs_read_at wants.
+// A region of the device.
 template <int Length>
 struct region {
-    uint8_t bytes[Length + 1]{};
+    uint8_t bytes[Length]{};
 
     bool read(int fd, int offset) { return fs_read_at(fd, bytes, offset, Length) == 0; }
     bool holds(size_t offset, const char* text) const
@@ -68,7 +68,7 @@ bool has_boot_signature(const sector& boot)
            boot.bytes[BOOT_SIGNATURE_OFFSET + 1] == 0xAA;
 }
 
-int32_t classify_ext(const uint8_t* superblock)
+fs_code classify_ext(const uint8_t* superblock)
 {
     if ((superblock[EXT_COMPAT_OFFSET] & EXT_HAS_JOURNAL) == 0) {
         return FS_EXT2;
@@ -82,41 +82,19 @@ int32_t classify_ext(const uint8_t* superblock)
     return FS_EXT3;
 }
 
-// exFAT also looks like FAT, and a GPT disk's first sector like an extended boot record: the order
-// decides what such a device is.
-constexpr int32_t (*PROBES[])(int) = {
-    fs_probe_ntfs,    fs_probe_exfat,    fs_probe_fat, fs_probe_ext,
-    fs_probe_hfsplus, fs_probe_extended, fs_probe_efi, fs_probe_mbr,
-};
-
-}  // namespace
-
-int fs_read_at(int fd, void* buffer, int offset, int length)
-{
-    if (lseek(fd, offset, SEEK_SET) != offset) {
-        log_errno("seek err!\n");
-        return -1;
-    }
-    if (read(fd, buffer, static_cast<size_t>(length)) != length) {
-        log_errno("read err! b = %s, len = %d\n", static_cast<const char*>(buffer), length);
-        return -1;
-    }
-    return 0;
-}
-
-int32_t fs_probe_ntfs(int fd)
+fs_code probe_ntfs(int fd)
 {
     sector boot;
     return boot.read(fd, 0) && boot.holds(OEM_ID_OFFSET, NTFS_OEM_ID) ? FS_NTFS : FS_NONE;
 }
 
-int32_t fs_probe_exfat(int fd)
+fs_code probe_exfat(int fd)
 {
     sector boot;
     return boot.read(fd, 0) && boot.holds(OEM_ID_OFFSET, EXFAT_OEM_ID) ? FS_EXFAT : FS_NONE;
 }
 
-int32_t fs_probe_fat(int fd)
+fs_code probe_fat(int fd)
 {
     sector boot;
     if (!boot.read(fd, 0) || !begins_with_jump(boot)) {
@@ -127,7 +105,7 @@ int32_t fs_probe_fat(int fd)
     return signed_boot && !boot.holds(OEM_ID_OFFSET, NTFS_OEM_ID) ? FS_FAT : FS_NONE;
 }
 
-int32_t fs_probe_ext(int fd)
+fs_code probe_ext(int fd)
 {
     region<EXT_SUPERBLOCK_SIZE> superblock;
     if (!superblock.read(fd, SUPERBLOCK_OFFSET)) {
@@ -139,7 +117,7 @@ int32_t fs_probe_ext(int fd)
     return classify_ext(superblock.bytes);
 }
 
-int32_t fs_probe_hfsplus(int fd)
+fs_code probe_hfsplus(int fd)
 {
     sector header;
     if (!header.read(fd, SUPERBLOCK_OFFSET)) {
@@ -149,7 +127,7 @@ int32_t fs_probe_hfsplus(int fd)
     return !journaled && header.holds(0, "H+") ? FS_HFSPLUS : FS_NONE;
 }
 
-int32_t fs_probe_extended(int fd)
+fs_code probe_extended(int fd)
 {
     sector boot;
     if (!boot.read(fd, 0)) {
@@ -158,25 +136,85 @@ int32_t fs_probe_extended(int fd)
     return has_boot_signature(boot) && !begins_with_jump(boot) ? FS_EXTENDED : FS_NONE;
 }
 
-int32_t fs_probe_efi(int fd)
+fs_code probe_efi(int fd)
 {
     sector header;
     return header.read(fd, SECTOR_SIZE) && header.holds(0, EFI_SIGNATURE) ? FS_EFI : FS_NONE;
 }
 
-int32_t fs_probe_mbr(int fd)
+fs_code probe_mbr(int fd)
 {
     sector boot;
     return boot.read(fd, 0) && has_boot_signature(boot) ? FS_MBR : FS_NONE;
 }
 
-int32_t fs_probe_all(int fd)
+struct probe {
+    fs_code (*find)(int fd);
+    fs_code codes[3];  // what it can find; FS_NONE fills up
+};
+
+// exFAT also looks like FAT, and a GPT disk's first sector like an extended boot record: the order
+// decides what such a device is.
+constexpr probe PROBES[] = {
+    {probe_ntfs, {FS_NTFS}},       {probe_exfat, {FS_EXFAT}},
+    {probe_fat, {FS_FAT}},         {probe_ext, {FS_EXT2, FS_EXT3, FS_EXT4}},
+    {probe_hfsplus, {FS_HFSPLUS}}, {probe_extended, {FS_EXTENDED}},
+    {probe_efi, {FS_EFI}},         {probe_mbr, {FS_MBR}},
+};
+
+constexpr const probe* probe_of(fs_code code)
 {
-    for (const auto probe : PROBES) {
-        const int32_t fs_type = probe(fd);
-        if (fs_type != FS_NONE) {
-            return fs_type;
+    for (const probe& row : PROBES) {
+        for (const fs_code found : row.codes) {
+            if (found == code) {
+                return &row;
+            }
+        }
+    }
+    return nullptr;
+}
+
+constexpr bool each_filesystem_is_probed()
+{
+    for (const filesystem& row : FILESYSTEMS) {
+        const bool detected = row.code != FS_NONE && row.code != FS_ERR;
+        if (detected && probe_of(row.code) == nullptr) {
+            return false;
+        }
+    }
+    return true;
+}
+static_assert(each_filesystem_is_probed(), "each filesystem is in the row of a probe");
+
+}  // namespace
+
+int fs_read_at(int fd, void* buffer, int offset, int length)
+{
+    if (lseek(fd, offset, SEEK_SET) != offset) {
+        log_errno("seek err!\n");
+        return -1;
+    }
+    if (read(fd, buffer, static_cast<size_t>(length)) != length) {
+        const auto* text = static_cast<const char*>(buffer);
+        log_errno("read err! b = %.*s, len = %d\n", length, text, length);
+        return -1;
+    }
+    return 0;
+}
+
+fs_code fs_probe_all(int fd)
+{
+    for (const probe& row : PROBES) {
+        const fs_code code = row.find(fd);
+        if (code != FS_NONE) {
+            return code;
         }
     }
     return FS_NONE;
+}
+
+fs_code fs_probe_one(fs_code code, int fd)
+{
+    const probe* row = probe_of(code);
+    return row != nullptr ? row->find(fd) : FS_NONE;
 }

@@ -1,24 +1,14 @@
 // Superblock probes: each looks for one published on-disk signature on an open device.
 #pragma once
 
-#include <cstdint>
-
 #include "util/fs_code.h"
 
-// A probe returns its type code when the signature is there, else FS_NONE. A read that fails is no
-// match.
-int32_t fs_probe_ntfs(int fd);
-int32_t fs_probe_exfat(int fd);
-int32_t fs_probe_fat(int fd);
-int32_t fs_probe_ext(int fd);
-int32_t fs_probe_hfsplus(int fd);
-int32_t fs_probe_extended(int fd);
-int32_t fs_probe_efi(int fd);
-int32_t fs_probe_mbr(int fd);
+// The code of the first probe that matches, FS_NONE when none does. A read that fails is no match.
+[[nodiscard]] fs_code fs_probe_all(int fd);
 
-// The first match of all probes in the order above, FS_NONE when there is none.
-int32_t fs_probe_all(int fd);
-
-// 0 when exactly length bytes were read at the byte offset, else -1. buffer keeps one zero byte
-// behind length: a failed read prints it as text.
+// 0 when exactly length bytes were read at the byte offset, else -1. A failed read prints the
+// buffer as text.
 int fs_read_at(int fd, void* buffer, int offset, int length);
+
+// For tests: what the one probe says that looks for a code.
+[[nodiscard]] fs_code fs_probe_one(fs_code code, int fd);

@@ -20,28 +20,33 @@ constexpr size_t TYPE_PREFIX_LENGTH = 4;
 constexpr char TYPE_KEY[] = "TYPE=";
 constexpr char RULE[] = "==========================\n";
 
-struct blkid_type {
-    const char* prefix;
-    fs_code code;
+struct name_list {
+    const char* names[FS_CODE_COUNT];
 };
+
+constexpr name_list names_of_table()
+{
+    name_list list{};
+    for (const filesystem& row : FILESYSTEMS) {
+        list.names[row.code] = row.name;
+    }
+    return list;
+}
+
+constexpr name_list NAMES = names_of_table();
 
 // Four characters decide, so that ntfs3 and ext4dev count as what they are.
-constexpr blkid_type BLKID_TYPES[] = {
-    {"vfat", FS_FAT},  {"ntfs", FS_NTFS}, {"ext2", FS_EXT2},
-    {"ext3", FS_EXT3}, {"ext4", FS_EXT4}, {"exfa", FS_EXFAT},
-};
-
-int32_t code_of_blkid_type(const char* type)
+fs_code code_of_blkid_type(const char* type)
 {
-    for (const blkid_type& entry : BLKID_TYPES) {
-        if (strncmp(type, entry.prefix, TYPE_PREFIX_LENGTH) == 0) {
-            return entry.code;
+    for (const filesystem& row : FILESYSTEMS) {
+        if (row.blkid_type != NO_TEXT && strncmp(type, row.blkid_type, TYPE_PREFIX_LENGTH) == 0) {
+            return row.code;
         }
     }
     return FS_NONE;
 }
 
-bool is_ext(int32_t fs_type)
+bool is_ext(fs_code fs_type)
 {
     return fs_type == FS_EXT2 || fs_type == FS_EXT3 || fs_type == FS_EXT4;
 }
@@ -55,19 +60,14 @@ void log_heading(const char* dev_path)
 
 }  // namespace
 
-constexpr const char* const fs_type_names[FS_CODE_COUNT] = {
-    "ERR FS",  "ERR FS", "MBR",  "EXT2",     "EXT3",  "FAT",
-    "HFSPLUS", "EFI",    "NTFS", "EXTENDED", "EXFAT", "EXT4",
-};
-static_assert(fs_type_names[FS_CODE_COUNT - 1] != nullptr, "each code has a name");
+const char* const (&fs_type_names)[FS_CODE_COUNT] = NAMES.names;
 
-const char* fs_type_name(int32_t fs_type)
+const char* fs_type_name(fs_code fs_type)
 {
-    const bool known = fs_type >= 0 && fs_type < FS_CODE_COUNT;
-    return fs_type_names[known ? fs_type : FS_NONE];
+    return filesystem_of(fs_type).name;
 }
 
-int32_t fs_detect_type(const char* dev_path)
+fs_code fs_detect_type(const char* dev_path)
 {
     log_heading(dev_path);
     const int fd = open(dev_path, O_RDONLY | O_CLOEXEC);
@@ -76,7 +76,7 @@ int32_t fs_detect_type(const char* dev_path)
         log_info("err, open dev = %s\n", dev_path);
         return FS_NONE;
     }
-    int32_t fs_type = fs_probe_all(fd);
+    fs_code fs_type = fs_probe_all(fd);
     close(fd);
 
     // The ext superblock only tells that blkid is to be asked which member of the family it is.
@@ -94,13 +94,13 @@ int32_t fs_detect_type(const char* dev_path)
     return fs_type;
 }
 
-int32_t fs_type_from_blkid(const char* dev_path)
+fs_code fs_type_from_blkid(const char* dev_path)
 {
     char type[FS_TYPE_TEXT_SIZE]{};
     if (fs_blkid_type(dev_path, type, sizeof(type)) != 0) {
         return FS_NONE;
     }
-    const int32_t fs_type = code_of_blkid_type(type);
+    const fs_code fs_type = code_of_blkid_type(type);
     fs_type_hook(fs_type, dev_path);
     return fs_type;
 }
@@ -136,7 +136,7 @@ int dev_has_fs_type(const char* dev_name)
     return fs_blkid_type(dev_path, type, sizeof(type)) == 0 ? 1 : 0;
 }
 
-int fs_type_hook(int32_t fs_type, const char* dev_path)
+int fs_type_hook(fs_code fs_type, const char* dev_path)
 {
     static_cast<void>(fs_type);
     static_cast<void>(dev_path);

@@ -2,13 +2,17 @@
 // plain words; the others refuse and log what a shell would not take as one.
 #pragma once
 
-#include <cstdint>
+#include "util/fs_code.h"
 
 // The mount command for a filesystem type code: a format that takes the device node and the mount
 // directory, in this order. Null for a type that is never mounted.
-const char* fs_mount_cmd_format(int32_t fs_type);
+const char* fs_mount_cmd_format(fs_code fs_type);
 
-// Repair the filesystem on a device node. Nothing in the daemon runs them. Always 0.
+// Nothing in the daemon runs repairs. The filesystem's own command for a device node; 0, or 1 for a
+// type without one.
+int fs_repair(fs_code fs_type, const char* dev_path);
+
+// fs_repair of one filesystem. Always 0.
 int fs_repair_ntfs(const char* dev_path);
 int fs_repair_exfat(const char* dev_path);
 int fs_repair_ext2(const char* dev_path);

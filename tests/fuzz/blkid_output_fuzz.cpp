@@ -39,7 +39,7 @@ std::string word_of(const std::string& output, const char* key)
     return value_of(output, key, "\" ").value_or("").substr(0, PART_UID_SIZE - 1);
 }
 
-int32_t code_of(const std::string& type)
+fs_code code_of(const std::string& type)
 {
     const std::string four = type.substr(0, 4);
     return four == "vfat"   ? FS_FAT
@@ -84,7 +84,7 @@ void check_type()
     require(out.text() == value.value_or(""), "the type ends at a quote, cut at 15 characters");
 }
 
-std::string expected_label(int32_t fs_type)
+std::string expected_label(fs_code fs_type)
 {
     const std::string label = word_of(plain_output, "LABEL=");
     const bool factory = fs_type == FS_FAT && std::count(label.begin(), label.end(), '-') >= 3;
@@ -97,7 +97,7 @@ std::string expected_label(int32_t fs_type)
 
 void check_record(bool is_root)
 {
-    const int32_t fs_type = code_of(expected_type().value_or(""));
+    const fs_code fs_type = code_of(expected_type().value_or(""));
     part_info part{};
     part.is_root_part = is_root ? 1 : 0;
     strcpy(part.dev_name, DEV_NAME);

@@ -22,7 +22,7 @@ constexpr size_t DEVICE_MAX = 4096;
 
 struct blkid_answer {
     const char* output;
-    int32_t code;
+    fs_code code;
 };
 
 constexpr blkid_answer ANSWERS[] = {
@@ -85,57 +85,57 @@ struct device_view {
     }
 };
 
-int32_t expected_ext(const device_view& view)
+fs_code expected_ext(const device_view& view)
 {
     const bool journal = (view.byte(1024 + 0x5C) & 4) != 0;
     const bool later = view.word(1024 + 0x60, 4) >= 0x40 || view.word(1024 + 0x64, 4) >= 8;
     return !journal ? FS_EXT2 : later ? FS_EXT4 : FS_EXT3;
 }
 
-using expectation = int32_t (*)(const device_view&);
+using expectation = fs_code (*)(const device_view&);
 
 // In the order in which they are looked for.
 constexpr expectation EXPECTATIONS[] = {
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(512) && v.holds(3, "NTFS    ") ? FS_NTFS : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(512) && v.holds(3, "EXFAT") ? FS_EXFAT : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(512) && v.jumps() && v.byte(510) == 0x55 && !v.holds(3, "NTFS    ")
                    ? FS_FAT
                    : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(2048) && v.word(1024 + 0x38, 2) == 0xEF53 ? expected_ext(v) : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(1536) && (v.byte(1030) & 0x20) == 0 && v.holds(1024, "H+") ? FS_HFSPLUS
                                                                                      : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(512) && v.word(510, 2) == 0xAA55 && !v.jumps() ? FS_EXTENDED : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(1024) && v.holds(512, "EFI PART") ? FS_EFI : FS_NONE;
     },
-    [](const device_view& v) -> int32_t {
+    [](const device_view& v) -> fs_code {
         return v.readable(512) && v.word(510, 2) == 0xAA55 ? FS_MBR : FS_NONE;
     },
 };
 
-constexpr int32_t (*PROBES[])(int) = {
-    fs_probe_ntfs,    fs_probe_exfat,    fs_probe_fat, fs_probe_ext,
-    fs_probe_hfsplus, fs_probe_extended, fs_probe_efi, fs_probe_mbr,
+// One code of each.
+constexpr fs_code PROBES[] = {
+    FS_NTFS, FS_EXFAT, FS_FAT, FS_EXT2, FS_HFSPLUS, FS_EXTENDED, FS_EFI, FS_MBR,
 };
 
-int32_t check_probes(const device_view& view)
+fs_code check_probes(const device_view& view)
 {
-    int32_t first = FS_NONE;
+    fs_code first = FS_NONE;
     for (size_t i = 0; i < std::size(PROBES); ++i) {
-        const int32_t expected = EXPECTATIONS[i](view);
-        require(PROBES[i](device) == expected, "each probe knows its signature");
+        const fs_code expected = EXPECTATIONS[i](view);
+        require(fs_probe_one(PROBES[i], device) == expected, "each probe knows its signature");
         first = first != FS_NONE ? first : expected;
     }
     require(fs_probe_all(device) == first, "the first signature wins");
@@ -180,9 +180,9 @@ void fuzz_one(const std::string& input)
                 pwrite(device, image.data(), image.size(), 0) == static_cast<ssize_t>(image.size()),
             "the fuzz program can write its device");
 
-    const int32_t probed = check_probes({image});
+    const fs_code probed = check_probes({image});
     const bool ext = probed == FS_EXT2 || probed == FS_EXT3 || probed == FS_EXT4;
-    const int32_t expected = probed == FS_NONE || ext ? answer.code : probed;
+    const fs_code expected = probed == FS_NONE || ext ? answer.code : probed;
     require(fs_detect_type(device_path.c_str()) == expected, "blkid is asked when it is its turn");
     require(strlen(fs_type_name(expected)) > 0, "every result has a name");
     check_reading(image, number_at(input, 0) / 2, 1 + input.size() % 600);

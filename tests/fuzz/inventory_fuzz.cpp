@@ -44,7 +44,7 @@ struct chooser {
         text_copy(part->label, text());
         part->total_len = number();
         part->free_size = number();
-        part->fs_type = byte() % (FS_CODE_COUNT + 4) - 2;
+        part->fs_type = static_cast<fs_code>(byte() % (FS_CODE_COUNT + 4) - 2);
     }
 
     void fill(disk_obj* disk)

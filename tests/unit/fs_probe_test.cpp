@@ -25,12 +25,25 @@ public:
     int fd;
 };
 
-int32_t probed(int32_t (*probe)(int), const image& device)
+constexpr fs_code EACH_CODE[] = {FS_NTFS,    FS_EXFAT,    FS_FAT, FS_EXT2,
+                                 FS_HFSPLUS, FS_EXTENDED, FS_EFI, FS_MBR};
+
+// What the probe for that code says.
+fs_code probed_for(fs_code code, const image& device)
 {
     device_fd open_device(device);
-    int32_t fs_type = -1;
-    support::capture_stdout([&] { fs_type = probe(open_device.fd); });
-    return fs_type;
+    fs_code found = FS_ERR;
+    support::capture_stdout([&] { found = fs_probe_one(code, open_device.fd); });
+    return found;
+}
+
+// What all probes say together.
+fs_code probed(const image& device)
+{
+    device_fd open_device(device);
+    fs_code found = FS_ERR;
+    support::capture_stdout([&] { found = fs_probe_all(open_device.fd); });
+    return found;
 }
 
 std::string bytes(std::initializer_list<int> values)
@@ -49,14 +62,14 @@ std::string little_endian_32(uint32_t value)
 }
 
 // A device whose superblock has the ext magic and these feature words.
-int32_t ext_probed(uint32_t compat, uint32_t incompat, uint32_t ro_compat)
+fs_code ext_probed(uint32_t compat, uint32_t incompat, uint32_t ro_compat)
 {
     image device(DEVICE_SIZE);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
     device.write_at(1024 + 0x5C, little_endian_32(compat));
     device.write_at(1024 + 0x60, little_endian_32(incompat));
     device.write_at(1024 + 0x64, little_endian_32(ro_compat));
-    return probed(fs_probe_ext, device);
+    return probed_for(FS_EXT2, device);
 }
 
 }  // namespace
@@ -64,32 +77,32 @@ int32_t ext_probed(uint32_t compat, uint32_t incompat, uint32_t ro_compat)
 TEST(FsProbe, ABlankDeviceMatchesNothing)
 {
     image device(DEVICE_SIZE);
-    for (auto probe : {fs_probe_ntfs, fs_probe_exfat, fs_probe_fat, fs_probe_ext, fs_probe_hfsplus,
-                       fs_probe_extended, fs_probe_efi, fs_probe_mbr, fs_probe_all}) {
-        EXPECT_EQ(probed(probe, device), 0);
+    for (fs_code code : EACH_CODE) {
+        EXPECT_EQ(probed_for(code, device), FS_NONE) << code;
     }
+    EXPECT_EQ(probed(device), FS_NONE);
 }
 
 TEST(FsProbe, AnEmptyDeviceMatchesNothing)
 {
     image device(0);
-    for (auto probe : {fs_probe_ntfs, fs_probe_exfat, fs_probe_fat, fs_probe_ext, fs_probe_hfsplus,
-                       fs_probe_extended, fs_probe_efi, fs_probe_mbr, fs_probe_all}) {
-        EXPECT_EQ(probed(probe, device), 0);
+    for (fs_code code : EACH_CODE) {
+        EXPECT_EQ(probed_for(code, device), FS_NONE) << code;
     }
+    EXPECT_EQ(probed(device), FS_NONE);
 }
 
 TEST(FsProbe, NtfsIsItsOemIdentifierWithFourSpaces)
 {
     struct {
         const char* oem;
-        int32_t expected;
+        int expected;
     } cases[] = {{"NTFS    ", 8}, {"NTFS   x", 0}, {"NTFS", 0}, {"ntfs    ", 0}, {" NTFS   ", 0}};
     for (const auto& c : cases) {
         image device(DEVICE_SIZE);
         device.write_at(3, c.oem);
-        EXPECT_EQ(probed(fs_probe_ntfs, device), c.expected) << c.oem;
-        EXPECT_EQ(probed(fs_probe_all, device), c.expected) << c.oem;
+        EXPECT_EQ(probed_for(FS_NTFS, device), c.expected) << c.oem;
+        EXPECT_EQ(probed(device), c.expected) << c.oem;
     }
 }
 
@@ -97,13 +110,13 @@ TEST(FsProbe, ExfatIsFiveBytesOfItsOemIdentifier)
 {
     struct {
         const char* oem;
-        int32_t expected;
+        int expected;
     } cases[] = {
         {"EXFAT   ", 10}, {"EXFATxyz", 10}, {"EXFAx   ", 0}, {"EXFAS", 0}, {"exfat   ", 0}};
     for (const auto& c : cases) {
         image device(DEVICE_SIZE);
         device.write_at(3, c.oem);
-        EXPECT_EQ(probed(fs_probe_exfat, device), c.expected) << c.oem;
+        EXPECT_EQ(probed_for(FS_EXFAT, device), c.expected) << c.oem;
     }
 }
 
@@ -114,7 +127,7 @@ TEST(FsProbe, FatIsAJumpAndTheFirstSignatureByte)
         int byte2;
         int byte510;
         int byte511;
-        int32_t expected;
+        int expected;
     } cases[] = {
         {0xEB, 0x90, 0x55, 0xAA, 5}, {0xEB, 0x90, 0x55, 0x00, 5}, {0xEB, 0x90, 0x55, 0xFF, 5},
         {0xE9, 0x00, 0x55, 0xAA, 5}, {0xE9, 0x90, 0x55, 0x00, 5}, {0xEB, 0x90, 0x54, 0xAA, 0},
@@ -125,7 +138,7 @@ TEST(FsProbe, FatIsAJumpAndTheFirstSignatureByte)
         image device(DEVICE_SIZE);
         device.write_at(0, bytes({c.byte0, 0x3C, c.byte2}));
         device.write_at(510, bytes({c.byte510, c.byte511}));
-        EXPECT_EQ(probed(fs_probe_fat, device), c.expected)
+        EXPECT_EQ(probed_for(FS_FAT, device), c.expected)
             << c.byte0 << ' ' << c.byte2 << ' ' << c.byte510;
     }
 }
@@ -135,7 +148,7 @@ TEST(FsProbe, FatIsFoundWithoutTheLastSignatureByte)
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x58, 0x90}));
     device.write_at(510, bytes({0x55}));
-    EXPECT_EQ(probed(fs_probe_all, device), 5);
+    EXPECT_EQ(probed(device), 5);
 }
 
 TEST(FsProbe, FatRefusesTheNtfsIdentifier)
@@ -143,8 +156,8 @@ TEST(FsProbe, FatRefusesTheNtfsIdentifier)
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x52, 0x90}) + "NTFS    ");
     device.write_at(510, bytes({0x55, 0xAA}));
-    EXPECT_EQ(probed(fs_probe_fat, device), 0);
-    EXPECT_EQ(probed(fs_probe_all, device), 8);
+    EXPECT_EQ(probed_for(FS_FAT, device), 0);
+    EXPECT_EQ(probed(device), 8);
 }
 
 TEST(FsProbe, ExfatComesBeforeFat)
@@ -152,19 +165,19 @@ TEST(FsProbe, ExfatComesBeforeFat)
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x76, 0x90}) + "EXFAT   ");
     device.write_at(510, bytes({0x55, 0xAA}));
-    EXPECT_EQ(probed(fs_probe_fat, device), 5);
-    EXPECT_EQ(probed(fs_probe_all, device), 10);
+    EXPECT_EQ(probed_for(FS_FAT, device), 5);
+    EXPECT_EQ(probed(device), 10);
 }
 
 TEST(FsProbe, ExtIsItsMagicInLittleEndian)
 {
     image device(DEVICE_SIZE);
     device.write_at(1024 + 0x38, bytes({0xEF, 0x53}));
-    EXPECT_EQ(probed(fs_probe_ext, device), 0);
+    EXPECT_EQ(probed_for(FS_EXT2, device), 0);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEE}));
-    EXPECT_EQ(probed(fs_probe_ext, device), 0);
+    EXPECT_EQ(probed_for(FS_EXT2, device), 0);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
-    EXPECT_EQ(probed(fs_probe_ext, device), 3);
+    EXPECT_EQ(probed_for(FS_EXT2, device), 3);
 }
 
 TEST(FsProbe, TheFeatureWordsTellTheMembersOfTheExtFamily)
@@ -173,7 +186,7 @@ TEST(FsProbe, TheFeatureWordsTellTheMembersOfTheExtFamily)
         uint32_t compat;
         uint32_t incompat;
         uint32_t ro_compat;
-        int32_t expected;
+        int expected;
     } cases[] = {
         // Without a journal it is ext2, whatever the other words hold.
         {0, 0, 0, 3},
@@ -211,7 +224,7 @@ TEST(FsProbe, HfsplusIsItsSignatureWithoutTheJournal)
     struct {
         const char* signature;
         int attributes;
-        int32_t expected;
+        int expected;
     } cases[] = {
         {"H+", 0x00, 6}, {"H+", 0xDF, 6}, {"H+", 0x20, 0}, {"H+", 0xFF, 0},
         {"HX", 0x00, 0}, {"+H", 0x00, 0}, {"h+", 0x00, 0},
@@ -220,8 +233,8 @@ TEST(FsProbe, HfsplusIsItsSignatureWithoutTheJournal)
         image device(DEVICE_SIZE);
         device.write_at(1024, c.signature);
         device.write_at(1024 + 6, bytes({c.attributes}));
-        EXPECT_EQ(probed(fs_probe_hfsplus, device), c.expected) << c.signature << c.attributes;
-        EXPECT_EQ(probed(fs_probe_all, device), c.expected) << c.signature << c.attributes;
+        EXPECT_EQ(probed_for(FS_HFSPLUS, device), c.expected) << c.signature << c.attributes;
+        EXPECT_EQ(probed(device), c.expected) << c.signature << c.attributes;
     }
 }
 
@@ -230,7 +243,7 @@ TEST(FsProbe, AnotherAttributeByteIsNotTheJournalFlag)
     image device(DEVICE_SIZE);
     device.write_at(1024, "H+");
     device.write_at(1024 + 4, bytes({0x20, 0x20, 0x00, 0x20}));
-    EXPECT_EQ(probed(fs_probe_hfsplus, device), 6);
+    EXPECT_EQ(probed_for(FS_HFSPLUS, device), 6);
 }
 
 TEST(FsProbe, AnExtendedRecordIsTheSignatureWithoutAJump)
@@ -240,7 +253,7 @@ TEST(FsProbe, AnExtendedRecordIsTheSignatureWithoutAJump)
         int byte2;
         int byte510;
         int byte511;
-        int32_t expected;
+        int expected;
     } cases[] = {
         {0x00, 0x00, 0x55, 0xAA, 9}, {0xFA, 0x90, 0x55, 0xAA, 9}, {0xEB, 0x00, 0x55, 0xAA, 9},
         {0xEB, 0x90, 0x55, 0xAA, 0}, {0xE9, 0x00, 0x55, 0xAA, 0}, {0x00, 0x00, 0x55, 0x00, 0},
@@ -250,7 +263,7 @@ TEST(FsProbe, AnExtendedRecordIsTheSignatureWithoutAJump)
         image device(DEVICE_SIZE);
         device.write_at(0, bytes({c.byte0, 0, c.byte2}));
         device.write_at(510, bytes({c.byte510, c.byte511}));
-        EXPECT_EQ(probed(fs_probe_extended, device), c.expected) << c.byte0 << ' ' << c.byte2;
+        EXPECT_EQ(probed_for(FS_EXTENDED, device), c.expected) << c.byte0 << ' ' << c.byte2;
     }
 }
 
@@ -258,12 +271,12 @@ TEST(FsProbe, AGptHeaderStandsInTheSecondSector)
 {
     image device(DEVICE_SIZE);
     device.write_at(512, "EFI PART");
-    EXPECT_EQ(probed(fs_probe_efi, device), 7);
-    EXPECT_EQ(probed(fs_probe_all, device), 7);
+    EXPECT_EQ(probed_for(FS_EFI, device), 7);
+    EXPECT_EQ(probed(device), 7);
     device.write_at(512, "EFI PARt");
-    EXPECT_EQ(probed(fs_probe_efi, device), 0);
+    EXPECT_EQ(probed_for(FS_EFI, device), 0);
     device.write_at(0, "EFI PART");
-    EXPECT_EQ(probed(fs_probe_efi, device), 0);
+    EXPECT_EQ(probed_for(FS_EFI, device), 0);
 }
 
 TEST(FsProbe, TheProtectiveRecordOfAGptDiskIsExtended)
@@ -272,8 +285,8 @@ TEST(FsProbe, TheProtectiveRecordOfAGptDiskIsExtended)
     device.write_at(446 + 4, bytes({0xEE}));
     device.write_at(510, bytes({0x55, 0xAA}));
     device.write_at(512, "EFI PART");
-    EXPECT_EQ(probed(fs_probe_efi, device), 7);
-    EXPECT_EQ(probed(fs_probe_all, device), 9);
+    EXPECT_EQ(probed_for(FS_EFI, device), 7);
+    EXPECT_EQ(probed(device), 9);
 }
 
 TEST(FsProbe, AnMbrIsTheWholeSignatureWhateverStandsBefore)
@@ -282,7 +295,7 @@ TEST(FsProbe, AnMbrIsTheWholeSignatureWhateverStandsBefore)
         int byte0;
         int byte510;
         int byte511;
-        int32_t expected;
+        int expected;
     } cases[] = {
         {0x00, 0x55, 0xAA, 2}, {0xE9, 0x55, 0xAA, 2}, {0xFA, 0x55, 0xAA, 2},
         {0x00, 0x55, 0x00, 0}, {0x00, 0x00, 0xAA, 0}, {0x00, 0xAA, 0x55, 0},
@@ -291,8 +304,19 @@ TEST(FsProbe, AnMbrIsTheWholeSignatureWhateverStandsBefore)
         image device(DEVICE_SIZE);
         device.write_at(0, bytes({c.byte0}));
         device.write_at(510, bytes({c.byte510, c.byte511}));
-        EXPECT_EQ(probed(fs_probe_mbr, device), c.expected);
+        EXPECT_EQ(probed_for(FS_MBR, device), c.expected);
     }
+}
+
+TEST(FsProbe, OneProbeServesTheWholeExtFamilyAndNoneServesNoFilesystem)
+{
+    image device(DEVICE_SIZE);
+    device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
+    for (fs_code code : {FS_EXT2, FS_EXT3, FS_EXT4}) {
+        EXPECT_EQ(probed_for(code, device), FS_EXT2);
+    }
+    EXPECT_EQ(probed_for(FS_ERR, device), FS_NONE);
+    EXPECT_EQ(probed_for(static_cast<fs_code>(1000), device), FS_NONE);
 }
 
 TEST(FsProbe, TheOrderDecidesBetweenTwoMatches)
@@ -300,39 +324,39 @@ TEST(FsProbe, TheOrderDecidesBetweenTwoMatches)
     image device(DEVICE_SIZE);
     device.write_at(510, bytes({0x55, 0xAA}));
     device.write_at(512, "EFI PART");
-    EXPECT_EQ(probed(fs_probe_all, device), 9);
+    EXPECT_EQ(probed(device), 9);
     device.write_at(1024, "H+");
-    EXPECT_EQ(probed(fs_probe_all, device), 6);
+    EXPECT_EQ(probed(device), 6);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
-    EXPECT_EQ(probed(fs_probe_all, device), 3);
+    EXPECT_EQ(probed(device), 3);
     device.write_at(0, bytes({0xEB, 0x58, 0x90}));
-    EXPECT_EQ(probed(fs_probe_all, device), 5);
+    EXPECT_EQ(probed(device), 5);
     device.write_at(3, "EXFAT   ");
-    EXPECT_EQ(probed(fs_probe_all, device), 10);
+    EXPECT_EQ(probed(device), 10);
     device.write_at(3, "NTFS    ");
-    EXPECT_EQ(probed(fs_probe_all, device), 8);
+    EXPECT_EQ(probed(device), 8);
 }
 
 TEST(FsProbe, EachProbeNeedsItsWholeRegion)
 {
     struct {
-        int32_t (*probe)(int);
+        fs_code code;
         off_t region_end;
         off_t offset;
         std::string mark;
-        int32_t expected;
+        int expected;
     } cases[] = {
-        {fs_probe_ntfs, 512, 3, "NTFS    ", 8},
-        {fs_probe_exfat, 512, 3, "EXFAT", 10},
-        {fs_probe_ext, 2048, 1024 + 0x38, bytes({0x53, 0xEF}), 3},
-        {fs_probe_hfsplus, 1536, 1024, "H+", 6},
-        {fs_probe_efi, 1024, 512, "EFI PART", 7},
+        {FS_NTFS, 512, 3, "NTFS    ", 8},
+        {FS_EXFAT, 512, 3, "EXFAT", 10},
+        {FS_EXT2, 2048, 1024 + 0x38, bytes({0x53, 0xEF}), 3},
+        {FS_HFSPLUS, 1536, 1024, "H+", 6},
+        {FS_EFI, 1024, 512, "EFI PART", 7},
     };
     for (const auto& c : cases) {
         for (off_t size : {c.region_end - 1, c.region_end, c.region_end + 1}) {
             image device(size);
             device.write_at(c.offset, c.mark);
-            EXPECT_EQ(probed(c.probe, device), size < c.region_end ? 0 : c.expected) << size;
+            EXPECT_EQ(probed_for(c.code, device), size < c.region_end ? 0 : c.expected) << size;
         }
     }
 }
@@ -341,11 +365,11 @@ TEST(FsProbe, ADeviceShorterThan2048BytesIsProbedByTheOtherTests)
 {
     image device(1536);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
-    EXPECT_EQ(probed(fs_probe_all, device), 0);
+    EXPECT_EQ(probed(device), 0);
     device.write_at(512, "EFI PART");
-    EXPECT_EQ(probed(fs_probe_all, device), 7);
+    EXPECT_EQ(probed(device), 7);
     device.write_at(1024, "H+");
-    EXPECT_EQ(probed(fs_probe_all, device), 6);
+    EXPECT_EQ(probed(device), 6);
 }
 
 TEST(FsReadAt, ReadsExactlyTheRegion)
@@ -373,6 +397,15 @@ TEST(FsReadAt, AShortReadIsLoggedWithTheBufferAsText)
     });
     EXPECT_EQ(log, "ERROR[fs_probe.cpp:N](" + std::string(strerror(EIO)) +
                        ")read err! b = xyz, len = 4\n");
+}
+
+TEST(FsReadAt, AFullBufferOfAShortReadIsPrintedUpToItsLength)
+{
+    image device(1024);
+    device_fd open_device(device);
+    char buffer[8] = {'1', '2', '3', '4', '5', '6', '7', '8'};
+    std::string log = log_of([&] { EXPECT_EQ(fs_read_at(open_device.fd, buffer, 1024, 4), -1); });
+    EXPECT_TRUE(support::contains(log, "read err! b = 1234, len = 4\n")) << log;
 }
 
 TEST(FsReadAt, AFailedSeekIsLogged)

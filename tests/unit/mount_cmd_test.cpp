@@ -25,38 +25,26 @@ std::string filled_in(const char* format, const char* device, const char* direct
 
 }  // namespace
 
-TEST(MountCommand, EachFilesystemHasItsOwn)
+TEST(MountCommand, IsThatOfTheFilesystemsRow)
 {
-    struct {
-        int32_t fs_type;
-        const char* format;
-    } cases[] = {
-        {10, "mount -t exfat %s %s"},
-        {5, "mount -t vfat -o rw,uid=1000,gid=1000,iocharset=utf8 %s %s"},
-        {11, "mount -t ext4 -o rw,defaults %s %s"},
-        {4, "mount -t ext3 -o rw,defaults %s %s"},
-        {3, "mount -t ext2 -o rw,defaults %s %s"},
-        {6, "mount -t hfsplus -o rw,defaults,uid=1000,gid=1000 %s %s"},
-        {8, "mount.ntfs-3g -o noatime,big_writes,async,force %s %s"},
-    };
-    for (const auto& c : cases) {
-        EXPECT_STREQ(fs_mount_cmd_format(c.fs_type), c.format);
+    for (const filesystem& row : FILESYSTEMS) {
+        EXPECT_STREQ(fs_mount_cmd_format(row.code), row.mount) << row.name;
     }
 }
 
-TEST(MountCommand, PartitionTablesAndUnknownTypesHaveNone)
+TEST(MountCommand, PartitionTablesAndNumbersThatAreNoCodeHaveNone)
 {
-    for (int32_t fs_type : {9, 7, 2, 1, 0, 12, -1, 100, INT32_MAX, INT32_MIN}) {
-        EXPECT_EQ(fs_mount_cmd_format(fs_type), nullptr) << fs_type;
+    for (int32_t number : {9, 7, 2, 1, 0, FS_CODE_COUNT, -1, 1000, INT32_MAX, INT32_MIN}) {
+        EXPECT_EQ(fs_mount_cmd_format(static_cast<fs_code>(number)), nullptr) << number;
     }
 }
 
 TEST(MountCommand, OnlyNtfsRunsItsOwnProgramWithoutATypeOption)
 {
-    for (int32_t fs_type : {3, 4, 5, 6, 10, 11}) {
-        EXPECT_EQ(std::string(fs_mount_cmd_format(fs_type)).rfind("mount -t ", 0), 0U) << fs_type;
+    for (fs_code code : {FS_EXT2, FS_EXT3, FS_FAT, FS_HFSPLUS, FS_EXFAT, FS_EXT4}) {
+        EXPECT_EQ(std::string(fs_mount_cmd_format(code)).rfind("mount -t ", 0), 0U) << code;
     }
-    std::string ntfs = fs_mount_cmd_format(8);
+    std::string ntfs = fs_mount_cmd_format(FS_NTFS);
     EXPECT_EQ(ntfs.rfind("mount.ntfs-3g ", 0), 0U);
     EXPECT_FALSE(contains(ntfs, " -t "));
 }
@@ -65,8 +53,8 @@ TEST(MountCommand, ASpaceInAnArgumentMakesTwoShellWords)
 {
     support::stub_programs stubs;
     stubs.add("mount", "echo $# >/run/words");
-    std::string plain = filled_in(fs_mount_cmd_format(10), "/dev/sda1", "/tmp/mountd/a");
-    std::string spaced = filled_in(fs_mount_cmd_format(10), "/dev/sda1", "/tmp/mountd/a b");
+    std::string plain = filled_in(fs_mount_cmd_format(FS_EXFAT), "/dev/sda1", "/tmp/mountd/a");
+    std::string spaced = filled_in(fs_mount_cmd_format(FS_EXFAT), "/dev/sda1", "/tmp/mountd/a b");
     ASSERT_EQ(system(plain.c_str()), 0);
     EXPECT_EQ(support::read_file("/run/words"), "4\n");
     ASSERT_EQ(system(spaced.c_str()), 0);
@@ -94,6 +82,16 @@ TEST(RepairCommand, EachFamilyRunsItsChecker)
         EXPECT_EQ(stubs.calls(), lines{c.command});
         EXPECT_TRUE(contains(log, std::string("exec cmd = ") + c.command + "\n")) << log;
     }
+}
+
+TEST(RepairCommand, OfATypeWithoutOneRunsNothing)
+{
+    const std::string log = log_of([] {
+        EXPECT_EQ(fs_repair(FS_HFSPLUS, "/dev/sda1"), 1);
+        EXPECT_EQ(fs_repair(FS_NONE, "/dev/sda1"), 1);
+        EXPECT_EQ(fs_repair(static_cast<fs_code>(1000), "/dev/sda1"), 1);
+    });
+    EXPECT_EQ(log, "");
 }
 
 TEST(RepairCommand, ACommandThatIsKilledIsTriedOnceAndGivesZero)

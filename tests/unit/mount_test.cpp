@@ -150,7 +150,7 @@ TEST_F(Mount, a_device_that_the_system_has_mounted_already_loses_its_name_and_ke
 
 TEST_F(Mount, an_unknown_filesystem_stays_unmounted_and_gets_no_directory)
 {
-    for (const int32_t type : {FS_NONE, FS_ERR, FS_MBR, FS_EFI, FS_EXTENDED}) {
+    for (const fs_code type : {FS_NONE, FS_ERR, FS_MBR, FS_EFI, FS_EXTENDED}) {
         part_info* part = put_ready_part(0, 1, "U-1");
         part->fs_type = type;
         const std::string log = capture_stdout([&] { mount_part(part); });
