@@ -5,10 +5,13 @@
 
 #include <cerrno>
 #include <cstring>
-#include <initializer_list>
+#include <iterator>
+#include <span>
+#include <string_view>
 
 #include "log/log.h"
 #include "util/file.h"
+#include "util/guard.h"
 #include "util/paths.h"
 #include "util/pause.h"
 #include "util/text.h"
@@ -20,14 +23,25 @@ constexpr uint32_t PIPE_CAPACITY = 65536;
 
 constexpr int FIFO_TRIES = 3;
 
+struct pipe_place {
+    const char* path;
+    int32_t event_pipes::*fd;
+};
+
+// In the order in which they are made and read.
+constexpr pipe_place PIPES[] = {
+    {PIPE_ADD_REMOVE, &event_pipes::fd_add_remove},
+    {PIPE_SAFE_REMOVE, &event_pipes::fd_safe_remove},
+    {PIPE_REMOVE, &event_pipes::fd_remove},
+};
+
 struct event_kind {
     event_code code;
     const char* keyword;
-    const char* name;
-    bool has_dev_name;
+    const char* name;   // in log lines
+    bool has_dev_name;  // ":" and a name follow the keyword
 };
 
-// A keyword matches as a prefix, so the order decides where two could match.
 constexpr event_kind EVENT_KINDS[] = {
     {EVENT_DISK_ADD, "add", "EVENT_DISK_ADD", true},
     {EVENT_DISK_REMOVE_DEV, "remove_dev", "EVENT_DISK_REMOVE_DEV", true},
@@ -35,6 +49,34 @@ constexpr event_kind EVENT_KINDS[] = {
     {EVENT_DISK_SAFE_REMOVE, "safe_remove", "EVENT_DISK_SAFE_REMOVE", false},
     {EVENT_DISK_HEART_BEAT, "heart_beat", "EVENT_DISK_HEART_BEAT", false},
 };
+
+consteval bool each_row_stands_at_its_code()
+{
+    int32_t code = EVENT_NONE;
+    for (const event_kind& kind : EVENT_KINDS) {
+        if (kind.code != ++code) {
+            return false;
+        }
+    }
+    return true;
+}
+
+// Keywords match as prefixes and the first match wins.
+consteval bool no_keyword_hides_a_later_one()
+{
+    for (size_t i = 0; i < std::size(EVENT_KINDS); ++i) {
+        for (size_t later = i + 1; later < std::size(EVENT_KINDS); ++later) {
+            if (std::string_view(EVENT_KINDS[later].keyword).starts_with(EVENT_KINDS[i].keyword)) {
+                return false;
+            }
+        }
+    }
+    return true;
+}
+
+static_assert(std::size(EVENT_KINDS) == EVENT_CODE_END - 1, "every event code has a row");
+static_assert(each_row_stands_at_its_code(), "rows stand in the order of their codes");
+static_assert(no_keyword_hides_a_later_one(), "every keyword can be reached");
 
 bool is_terminator(char c)
 {
@@ -51,7 +93,8 @@ void prepare_sets(event_pipes* pipes)
     FD_ZERO(&pipes->read_set);
     FD_ZERO(&pipes->except_set);
     pipes->max_fd = 0;
-    for (const int32_t fd : {pipes->fd_add_remove, pipes->fd_safe_remove, pipes->fd_remove}) {
+    for (const pipe_place& place : PIPES) {
+        const int32_t fd = pipes->*place.fd;
         FD_SET(fd, &pipes->read_set);
         FD_SET(fd, &pipes->except_set);
         pipes->max_fd = largest(pipes->max_fd, fd);
@@ -60,28 +103,29 @@ void prepare_sets(event_pipes* pipes)
 }
 
 // Reads one message byte by byte. A line without its terminator is lost: its writer broke off.
-int read_message(int fd, char* buffer, uint32_t size)
+int read_message(int fd, std::span<char> buffer)
 {
-    uint32_t stored = 0;
+    size_t stored = 0;
     char c = 0;
     for (uint32_t taken = 0; taken < PIPE_CAPACITY && read(fd, &c, 1) == 1; ++taken) {
-        if (stored < size - 1) {
+        if (stored < buffer.size() - 1) {
             buffer[stored++] = c;
         }
         if (is_terminator(c)) {
-            log_info("get event = %s\n", buffer);
+            log_info("get event = %s\n", buffer.data());
             return static_cast<int>(stored);
         }
     }
     // Nothing of it may stand behind the message of the next pipe.
-    memset(buffer, 0, size);
+    memset(buffer.data(), 0, buffer.size());
     return 0;
 }
 
-int read_pipe(const event_pipes* pipes, int fd, char* buffer, uint32_t size)
+// As event_wait, of one pipe that select has looked at.
+int read_pipe(const event_pipes* pipes, int fd, std::span<char> buffer)
 {
     if (FD_ISSET(fd, &pipes->read_set)) {
-        return read_message(fd, buffer, size);
+        return read_message(fd, buffer);
     }
     if (FD_ISSET(fd, &pipes->except_set)) {
         log_errno("pipe err, fd = %d\n", fd);
@@ -101,26 +145,30 @@ bool is_fifo(int fd)
 int open_fifo(const char* path)
 {
     for (int i = 0; i < FIFO_TRIES; ++i) {
-        const int fd = fifo_create_open(path);
+        fd_guard fd(fifo_create_open(path));
         if (fd < 0 || is_fifo(fd)) {
-            return fd;
+            return fd.release();
         }
-        close(fd);
         file_delete(path);
     }
     log_err("err, pipe = %s\n", path);
     return -1;
 }
 
+// 0 is what a cleared record holds.
 void close_pipe(int32_t fd)
 {
     if (fd > 0) {
-        close(fd);
+        const fd_guard closed_here(fd);
     }
 }
 
+// Null when no keyword matches. Whatever stands in place of the "#" is passed over.
 const event_kind* kind_of_message(const char* message)
 {
+    if (message[0] == '\0') {
+        return nullptr;
+    }
     for (const event_kind& kind : EVENT_KINDS) {
         if (text_has_prefix(message + 1, kind.keyword)) {
             return &kind;
@@ -139,21 +187,12 @@ int event_pipes_open(event_pipes* pipes)
     memset(pipes, 0, sizeof(*pipes));
     const bool have_own_dir = dir_make_own(RUNTIME_DIR) == 0;
 
-    struct pipe_place {
-        const char* path;
-        int32_t* fd;
-    };
-    const pipe_place places[] = {
-        {PIPE_ADD_REMOVE, &pipes->fd_add_remove},
-        {PIPE_SAFE_REMOVE, &pipes->fd_safe_remove},
-        {PIPE_REMOVE, &pipes->fd_remove},
-    };
-    for (const pipe_place& place : places) {
+    for (const pipe_place& place : PIPES) {
         file_delete(place.path);
     }
-    for (const pipe_place& place : places) {
-        *place.fd = open_fifo(place.path);
-        if (*place.fd < 0) {
+    for (const pipe_place& place : PIPES) {
+        pipes->*place.fd = open_fifo(place.path);
+        if (pipes->*place.fd < 0) {
             return 1;
         }
     }
@@ -169,9 +208,9 @@ int event_pipes_close(event_pipes* pipes)
     if (pipes == nullptr) {
         return 1;
     }
-    close_pipe(pipes->fd_add_remove);
-    close_pipe(pipes->fd_safe_remove);
-    close_pipe(pipes->fd_remove);
+    for (const pipe_place& place : PIPES) {
+        close_pipe(pipes->*place.fd);
+    }
     memset(pipes, 0, sizeof(*pipes));
     return 0;
 }
@@ -192,8 +231,8 @@ int event_wait(event_pipes* pipes, char* buffer, uint32_t size)
     if (ready < 1) {
         return ready;
     }
-    for (const int32_t fd : {pipes->fd_add_remove, pipes->fd_safe_remove, pipes->fd_remove}) {
-        const int ret = read_pipe(pipes, fd, buffer, size);
+    for (const pipe_place& place : PIPES) {
+        const int ret = read_pipe(pipes, pipes->*place.fd, std::span(buffer, size));
         if (ret != 0) {
             return ret;
         }
@@ -207,10 +246,11 @@ int event_receive(event_pipes* pipes)
     if (event_wait(pipes, message, sizeof(message)) <= 0) {
         return 0;
     }
+    // Without a word: the rest of a line that held a ";" arrives like this.
     if (message[0] != '#') {
         return 0;
     }
-    return event_parse(pipes, message) == 0 ? 1 : 0;
+    return event_parse(pipes, message) == 0 ? EVENT_RECEIVED : 0;
 }
 
 int event_parse(event_pipes* pipes, const char* message)
@@ -219,7 +259,7 @@ int event_parse(event_pipes* pipes, const char* message)
         return 1;
     }
     pipes->event = {};
-    const event_kind* kind = message[0] != '\0' ? kind_of_message(message) : nullptr;
+    const event_kind* kind = kind_of_message(message);
     if (kind == nullptr) {
         log_err("err event = %s\n", message);
         return 1;

@@ -8,6 +8,8 @@
 
 #include <cstdint>
 
+// To add an event: its code here, its row in event_pipes.cpp, its case in manager_dispatch. Without
+// one of them nothing compiles.
 enum event_code : int32_t {
     EVENT_NONE = 0,
     EVENT_DISK_ADD = 1,
@@ -15,6 +17,7 @@ enum event_code : int32_t {
     EVENT_DISK_REMOVE_DISK = 3,
     EVENT_DISK_SAFE_REMOVE = 4,
     EVENT_DISK_HEART_BEAT = 5,
+    EVENT_CODE_END,  // stays last and is no event: one more than the last code
 };
 
 constexpr int32_t EVENT_NAME_SIZE = 32;
@@ -22,7 +25,7 @@ constexpr uint32_t EVENT_LINE_SIZE = 256;
 constexpr int EVENT_WAIT_SECONDS = 3;
 
 struct disk_event {
-    int32_t type;                    // an event_code
+    event_code type;                 // EVENT_NONE when there is none
     char dev_name[EVENT_NAME_SIZE];  // zero-filled; 32 characters leave no terminating zero
 };
 
@@ -37,6 +40,9 @@ struct event_pipes {
     disk_event event;  // the last parsed event
 };
 
+// What event_receive answers when there is an event.
+constexpr int EVENT_RECEIVED = 1;
+
 // Makes the pipes afresh, so that no message of an earlier run is left, and opens them. 0 or 1.
 int event_pipes_open(event_pipes* pipes);
 
@@ -48,7 +54,7 @@ int event_pipes_close(event_pipes* pipes);
 // stored, 0 when there was no message, -1 on a pipe error.
 int event_wait(event_pipes* pipes, char* buffer, uint32_t size);
 
-// 1 when a valid event is now in the record's event, else 0.
+// EVENT_RECEIVED when a valid event is now in the record's event, else 0.
 int event_receive(event_pipes* pipes);
 
 // Turns a message into the record's event. Keywords match by prefix. 0, 1 on a bad message.
@@ -58,5 +64,5 @@ int event_parse(event_pipes* pipes, const char* message);
 // 1 without a ":" or when more than max characters follow it.
 int event_parse_dev_name(const char* message, char* out, int32_t max);
 
-// The name that log lines print for a type code.
+// The name that log lines print for a type code; "err event" for a number that is none.
 const char* event_name(int32_t type);

@@ -83,7 +83,7 @@ bool somebody_is_there(time_t* last, time_t now)
 bool receive_event(disk_manager* manager)
 {
     signal_inbox_report();
-    const bool received = event_receive(&manager->pipes) == 1;
+    const bool received = event_receive(&manager->pipes) == EVENT_RECEIVED;
     signal_inbox_report();
     return received;
 }
@@ -289,10 +289,12 @@ int manager_dispatch(disk_manager* manager)
             return on_safe_remove(manager);
         case EVENT_DISK_HEART_BEAT:
             return 0;
-        default:
-            log_err("err event type = %d\n", event->type);
-            return 1;
+        case EVENT_NONE:
+        case EVENT_CODE_END:
+            break;
     }
+    log_err("err event type = %d\n", event->type);
+    return 1;
 }
 
 int manager_idle(disk_manager* manager)

@@ -61,17 +61,32 @@ struct expected_event {
     std::string name;
 };
 
+struct known_event {
+    const char* keyword;
+    bool carries_name;
+};
+
+// By code, from 1.
+constexpr std::array<known_event, 5> KNOWN_EVENTS = {{
+    {"add", true},
+    {"remove_dev", true},
+    {"remove_disk", true},
+    {"safe_remove", false},
+    {"heart_beat", false},
+}};
+
+static_assert(KNOWN_EVENTS.size() == EVENT_CODE_END - 1, "every event is expected here");
+
 expected_event meaning_of(const std::string& message)
 {
-    const std::array<const char*, 5> keywords = {"add", "remove_dev", "remove_disk", "safe_remove",
-                                                 "heart_beat"};
     const std::string text = c_text(message);
-    for (size_t i = 0; i < keywords.size(); ++i) {
-        if (text.empty() || text.compare(1, strlen(keywords[i]), keywords[i]) != 0) {
+    for (size_t i = 0; i < KNOWN_EVENTS.size(); ++i) {
+        const known_event& event = KNOWN_EVENTS[i];
+        if (text.empty() || text.compare(1, strlen(event.keyword), event.keyword) != 0) {
             continue;
         }
         const auto type = static_cast<int32_t>(i + 1);
-        if (type > EVENT_DISK_REMOVE_DISK) {
+        if (!event.carries_name) {
             return {type, ""};
         }
         const size_t colon = text.find(':');
@@ -110,7 +125,9 @@ void carry_out()
         case EVENT_DISK_SAFE_REMOVE:
             safe_remove_all(&disks);
             break;
-        default:
+        case EVENT_DISK_HEART_BEAT:
+        case EVENT_NONE:
+        case EVENT_CODE_END:
             break;
     }
     require(disk_sets_count(&disks) <= 2, "only what the kernel lists is ever added");

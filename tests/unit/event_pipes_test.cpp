@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <chrono>
 #include <csignal>
+#include <cstddef>
 #include <cstring>
 #include <string>
 
@@ -35,6 +36,21 @@ void send(const char* pipe_path, const std::string& bytes)
     EXPECT_EQ(write(fd, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
     close(fd);
 }
+
+struct known_event {
+    const char* keyword;
+    const char* log_name;
+    bool carries_name;
+};
+
+// By code, from 1.
+constexpr known_event KNOWN_EVENTS[] = {
+    {"add", "EVENT_DISK_ADD", true},
+    {"remove_dev", "EVENT_DISK_REMOVE_DEV", true},
+    {"remove_disk", "EVENT_DISK_REMOVE_DISK", true},
+    {"safe_remove", "EVENT_DISK_SAFE_REMOVE", false},
+    {"heart_beat", "EVENT_DISK_HEART_BEAT", false},
+};
 
 class EventPipes : public testing::Test {
 protected:
@@ -361,21 +377,30 @@ TEST_F(EventParse, add_with_a_newline_yields_code_1_and_the_bare_name)
     EXPECT_EQ(whole_name(pipes.event), "sda");
 }
 
-TEST_F(EventParse, the_five_keywords_give_their_codes)
+TEST_F(EventParse, each_keyword_gives_its_code_its_log_name_and_a_name_where_it_carries_one)
 {
-    struct expectation {
-        const char* message;
-        int type;
-        const char* name;
-    };
-    for (const expectation& expected :
-         {expectation{"#add:sda1\n", 1, "sda1"}, expectation{"#remove_dev:sdb\n", 2, "sdb"},
-          expectation{"#remove_disk:disk1_part2\n", 3, "disk1_part2"},
-          expectation{"#safe_remove\n", 4, ""}, expectation{"#heart_beat\n", 5, ""}}) {
-        EXPECT_EQ(event_parse(&pipes, expected.message), 0) << expected.message;
-        EXPECT_EQ(pipes.event.type, expected.type) << expected.message;
-        EXPECT_EQ(whole_name(pipes.event), expected.name) << expected.message;
+    int code = 0;
+    for (const known_event& event : KNOWN_EVENTS) {
+        ++code;
+        const std::string message = std::string("#") + event.keyword + ":sda1\n";
+        EXPECT_EQ(event_parse(&pipes, message.c_str()), 0) << message;
+        EXPECT_EQ(pipes.event.type, code) << message;
+        EXPECT_EQ(whole_name(pipes.event), event.carries_name ? "sda1" : "") << message;
+        EXPECT_STREQ(event_name(code), event.log_name);
+
+        const std::string bare = std::string("#") + event.keyword + "\n";
+        const std::string log = capture_stdout(
+            [&] { EXPECT_EQ(event_parse(&pipes, bare.c_str()), event.carries_name ? 1 : 0); });
+        EXPECT_EQ(contains(log, "err event"), event.carries_name) << bare;
     }
+    EXPECT_EQ(code, EVENT_CODE_END - 1) << "event " << code + 1 << " has no row in this test";
+}
+
+TEST_F(EventParse, the_type_of_an_event_takes_the_four_bytes_of_its_number)
+{
+    EXPECT_EQ(sizeof(pipes.event.type), sizeof(int32_t));
+    EXPECT_EQ(sizeof(disk_event), sizeof(int32_t) + EVENT_NAME_SIZE);
+    EXPECT_EQ(offsetof(disk_event, dev_name), sizeof(int32_t));
 }
 
 TEST_F(EventParse, keywords_match_as_prefixes)
@@ -392,7 +417,7 @@ TEST_F(EventParse, unknown_and_shortened_keywords_are_bad_messages)
 {
     for (const char* message :
          {"#ad:sda\n", "#Add:sda\n", "# add:sda\n", "#remove:sda\n", "#heart\n", "#\n", ""}) {
-        pipes.event.type = 1;
+        pipes.event.type = EVENT_DISK_ADD;
         const std::string log =
             capture_stdout([&] { EXPECT_EQ(event_parse(&pipes, message), 1) << message; });
         EXPECT_TRUE(contains(log, std::string("err event = ") + message + "\n")) << log;
@@ -453,14 +478,9 @@ TEST_F(EventParse, heart_beat_followed_by_anything_is_code_5)
     EXPECT_EQ(whole_name(pipes.event), "");
 }
 
-TEST_F(EventParse, the_log_names_of_the_codes)
+TEST_F(EventParse, numbers_that_are_no_code_have_the_log_name_err_event)
 {
-    EXPECT_STREQ(event_name(1), "EVENT_DISK_ADD");
-    EXPECT_STREQ(event_name(2), "EVENT_DISK_REMOVE_DEV");
-    EXPECT_STREQ(event_name(3), "EVENT_DISK_REMOVE_DISK");
-    EXPECT_STREQ(event_name(4), "EVENT_DISK_SAFE_REMOVE");
-    EXPECT_STREQ(event_name(5), "EVENT_DISK_HEART_BEAT");
-    for (const int other : {0, 6, -1, 1000}) {
+    for (const int other : {0, -1, 1000, INT32_MAX, INT32_MIN}) {
         EXPECT_STREQ(event_name(other), "err event") << other;
     }
 }

@@ -91,7 +91,7 @@ protected:
     int dispatch(int32_t type, const char* name)
     {
         manager->pipes.event = {};
-        manager->pipes.event.type = type;
+        manager->pipes.event.type = static_cast<event_code>(type);
         text_copy(manager->pipes.event.dev_name, name);
         return manager_dispatch(manager);
     }
@@ -250,7 +250,7 @@ TEST_F(Manager, a_name_of_32_characters_is_never_read_beyond_its_field)
     memset(&manager->disks.sorted_once, 0, sizeof(manager->disks.sorted_once));
     // The inventory stands right behind the event; its first bytes would be read as part of it.
     text_copy(manager->disks.entries[0].disk.root.uid, "BEHIND");
-    for (const int32_t type : {EVENT_DISK_ADD, EVENT_DISK_REMOVE_DEV, EVENT_DISK_REMOVE_DISK}) {
+    for (const event_code type : {EVENT_DISK_ADD, EVENT_DISK_REMOVE_DEV, EVENT_DISK_REMOVE_DISK}) {
         manager->pipes.event.type = type;
         memcpy(manager->pipes.event.dev_name, name.data(), EVENT_NAME_SIZE);
         const std::string log = capture_stdout([&] { manager_dispatch(manager); });
@@ -330,9 +330,19 @@ TEST_F(Manager, heart_beats_do_nothing_and_unknown_types_answer_1)
     EXPECT_EQ(dispatch(EVENT_DISK_HEART_BEAT, ""), 0);
     EXPECT_EQ(manager->state, 1);
     EXPECT_EQ(manager->changed, 0);
-    const std::string log = capture_stdout([&] { EXPECT_EQ(dispatch(9, ""), 1); });
-    EXPECT_TRUE(contains(log, "===> get event = err event\n"));
-    EXPECT_TRUE(contains(log, "]err event type = 9\n"));
+    for (const int32_t type : {0, -1, 1000, INT32_MAX, INT32_MIN}) {
+        const std::string log = capture_stdout([&] { EXPECT_EQ(dispatch(type, ""), 1); });
+        EXPECT_TRUE(contains(log, "===> get event = err event\n")) << log;
+        EXPECT_TRUE(contains(log, "]err event type = " + std::to_string(type) + "\n")) << log;
+    }
+}
+
+TEST_F(Manager, every_event_that_can_be_parsed_is_acted_on)
+{
+    for (int32_t type = EVENT_NONE + 1; type < EVENT_CODE_END; ++type) {
+        const std::string log = capture_stdout([&] { dispatch(type, ""); });
+        EXPECT_FALSE(contains(log, "err event type")) << log;
+    }
 }
 
 TEST_F(Manager, the_first_idle_cycle_refreshes_updates_publishes_and_rescans_at_once)
