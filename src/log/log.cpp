@@ -5,6 +5,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
@@ -19,10 +20,16 @@ constexpr size_t LOG_PATH_SIZE = 128;
 constexpr int32_t LOG_LINES_MAX = 1500;
 constexpr mode_t LOG_FILE_MODE = 0644;
 
-uint8_t log_debug = 1;
-volatile uint8_t log_syslog = 0;
-FILE* log_fp = nullptr;
-int32_t log_lines = 0;
+struct log_state {
+    uint8_t log_debug = 1;
+    std::atomic<uint8_t> log_syslog{0};  // set by a signal handler
+    FILE* log_fp = nullptr;
+    int32_t log_lines = 0;  // written to the file in the life of the process
+};
+
+static_assert(std::atomic<uint8_t>::is_always_lock_free, "a signal handler writes log_syslog");
+
+constinit log_state state;
 
 const char* base_name(const char* file)
 {
@@ -78,7 +85,7 @@ void log_printf(int32_t level, const char* file, int32_t line, const char* fmt, 
 {
     char header[HEADER_SIZE]{};
     char message[MESSAGE_SIZE]{};
-    if (log_debug == 0) {
+    if (state.log_debug == 0) {
         return;
     }
 
@@ -94,7 +101,7 @@ void log_printf(int32_t level, const char* file, int32_t line, const char* fmt, 
     va_end(args);
 
     log_print_stdout("%s", message);
-    if (log_syslog != 0) {
+    if (state.log_syslog != 0) {
         put_syslog(message);
     }
     errno = saved_errno;
@@ -112,12 +119,12 @@ void log_print_stdout(const char* fmt, ...)
 
 void log_set_debug()
 {
-    log_debug = 1;
+    state.log_debug = 1;
 }
 
 void log_enable_syslog()
 {
-    log_syslog = 1;
+    state.log_syslog = 1;
 }
 
 int log_file_open()
@@ -129,8 +136,8 @@ int log_file_open()
     char path[LOG_PATH_SIZE]{};
     snprintf(path, sizeof(path), "/tmp/log/disk_log-%d-%d-%d-%d-%d-%d.txt", date.tm_year + 1900,
              date.tm_mon + 1, date.tm_mday, date.tm_hour, date.tm_min, date.tm_sec);
-    log_fp = open_log(path);
-    if (log_fp == nullptr) {
+    state.log_fp = open_log(path);
+    if (state.log_fp == nullptr) {
         log_print_stdout("err, file = %s\n", path);
         return 1;
     }
@@ -139,22 +146,30 @@ int log_file_open()
 
 int log_file_close()
 {
-    if (log_fp != nullptr) {
-        fclose(log_fp);
+    if (state.log_fp != nullptr) {
+        fclose(state.log_fp);
     }
     return 0;
 }
 
 int log_file_write(const char* text)
 {
-    if (log_fp == nullptr && log_file_open() != 0) {
+    if (state.log_fp == nullptr && log_file_open() != 0) {
         return 1;
     }
-    if (log_lines > LOG_LINES_MAX) {
+    if (state.log_lines > LOG_LINES_MAX) {
         return 1;
     }
-    ++log_lines;
-    fwrite(text, 1, strlen(text), log_fp);
-    fflush(log_fp);
+    ++state.log_lines;
+    fwrite(text, 1, strlen(text), state.log_fp);
+    fflush(state.log_fp);
     return 0;
+}
+
+void log_reset()
+{
+    state.log_debug = 1;
+    state.log_syslog = 0;
+    state.log_fp = nullptr;
+    state.log_lines = 0;
 }

@@ -38,3 +38,7 @@ int log_file_close();
 // Appends text to the log file, opening it when needed. 0 when written; 1 when the file cannot be
 // opened or 1501 writes were made already, so that a chatty caller cannot fill a RAM disk.
 int log_file_write(const char* text);
+
+// Puts the log back to its beginning: no syslog, no log file, no line counted. For tests. A log
+// file that is open must be closed before.
+void log_reset();

@@ -24,7 +24,7 @@ void print_version()
     printf("date:%s %s\n", BUILD_DATE, BUILD_TIME);
 }
 
-// -e stays untold: it is for the block hook, not for people.
+// -e is left out: it is for the block hook, not for people.
 [[noreturn]] void exit_with_usage(const char* program)
 {
     fprintf(stderr,

@@ -10,7 +10,6 @@
 #include "log/log.h"
 #include "manager/rescan.h"
 #include "manager/services.h"
-#include "manager/signal_inbox.h"
 #include "util/block_dev.h"
 #include "util/file.h"
 #include "util/paths.h"
@@ -18,73 +17,90 @@
 #include "util/process.h"
 #include "util/text.h"
 
-volatile int32_t running = 1;
-int32_t restart_requested = 0;
-
 namespace {
 
-constexpr int32_t SYS_TIMEOUT_SECONDS = 60;
+// What lasts as long as the process, however often the manager is set up again.
+struct manager_life {
+    std::atomic<int32_t> running{1};
+    int32_t restart_requested = 0;
+    int32_t sys_timeout = 60;  // seconds of silence that the loop bears
+    void (*report_signals)() = nullptr;
+};
+
+static_assert(std::atomic<int32_t>::is_always_lock_free, "a signal handler writes running");
+
+constinit manager_life life;
+disk_manager the_manager;
+
 constexpr int32_t SYS_TIMEOUT_FACTOR = 5;
-constexpr char COMPANION_PROCESS[] = "tarn_nas_sys";
 
 constexpr time_t REFRESH_AFTER_SECONDS = 4;
 constexpr time_t UPDATE_EVERY_SECONDS = 3;
 constexpr time_t PUBLISH_AFTER_SECONDS = 29;
 constexpr time_t RESCAN_EVERY_SECONDS = 8;
 
-disk_manager the_manager;
+enum scan_result {
+    SCAN_FAILED,  // the kernel's list cannot be opened
+    SCAN_NO_DISK,
+    SCAN_HAS_DISK,
+};
 
-// The heart-beat limit. Each safe removal lengthens it for the rest of the process's life.
-int32_t sys_timeout = SYS_TIMEOUT_SECONDS;
-
-// Adds every disk that the kernel lists. 1 when there was any, 0 when none, -1 when the list cannot
-// be opened.
-int add_all_disks(disk_sets* disks)
+// Adds every disk that the kernel lists.
+scan_result add_all_disks(disk_sets* disks)
 {
     dir_stream dir(SYS_BLOCK);
     if (dir.stream == nullptr) {
         log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return -1;
+        return SCAN_FAILED;
     }
     log_info("scan path = %s\n", SYS_BLOCK);
-    int have_disk = 0;
+    bool have_disk = false;
     while (const char* name = dir.next_name()) {
         log_info("d_name = %s\n", name);
         if (dev_name_is_disk(name) == 0) {
             disk_sets_add_dev(disks, name);
-            have_disk = 1;
+            have_disk = true;
         }
     }
     // Who knows what comes behind the place where reading broke off. The rescans, which wait for a
     // first disk, shall find it.
     if (dir.failed) {
-        have_disk = 1;
+        have_disk = true;
     }
-    log_info("have disk = %d\n", have_disk);
-    return have_disk;
+    log_info("have disk = %d\n", have_disk ? 1 : 0);
+    return have_disk ? SCAN_HAS_DISK : SCAN_NO_DISK;
 }
 
-// False when nobody has written an event for too long and the companion process is gone.
-bool somebody_is_there(time_t* last, time_t now)
+// False when no event came for too long and the companion process is gone: docs/limits.md, "It ends
+// when nobody needs it".
+bool is_needed(time_t* last, time_t now)
 {
     const time_t silence = now - *last;
-    if (silence <= sys_timeout) {
+    if (silence <= life.sys_timeout) {
         return true;
     }
-    log_warn("sys timeout, %d > %d\n", static_cast<int>(silence), sys_timeout);
-    if (proc_exists(COMPANION_PROCESS) != 1) {
+    log_warn("sys timeout, %d > %d\n", static_cast<int>(silence), life.sys_timeout);
+    if (proc_exists(COMPANION_PROCESS) == 0) {
         return false;
     }
     *last = now;
     return true;
 }
 
-// Tells of the signals that arrived during the last cycle's work, and of those that end the wait.
+void report_signals()
+{
+    if (life.report_signals != nullptr) {
+        life.report_signals();
+    }
+}
+
+// With the messages of the signals that arrived during the last cycle's work, and of those that end
+// the wait.
 bool receive_event(disk_manager* manager)
 {
-    signal_inbox_report();
+    report_signals();
     const bool received = event_receive(&manager->pipes) == EVENT_RECEIVED;
-    signal_inbox_report();
+    report_signals();
     return received;
 }
 
@@ -99,7 +115,8 @@ int on_add(disk_manager* manager, const char* dev_name)
     return disk_sets_add_dev(&manager->disks, dev_name);
 }
 
-// The file services must not hold files open while something is unmounted.
+// The file services must not hold files open while something is unmounted. They are stopped and
+// started for an unknown name too; what went wrong is logged where it happened.
 int on_remove(disk_manager* manager, const char* name, int (*operation)(disk_sets*, const char*))
 {
     manager->changed = 1;
@@ -107,6 +124,15 @@ int on_remove(disk_manager* manager, const char* name, int (*operation)(disk_set
     operation(&manager->disks, name);
     services_start();
     return 0;
+}
+
+// For the rest of the process's life: docs/limits.md, "It ends when nobody needs it".
+void lengthen_sys_timeout()
+{
+    int32_t* seconds = &life.sys_timeout;
+    if (*seconds <= INT32_MAX / SYS_TIMEOUT_FACTOR) {
+        *seconds *= SYS_TIMEOUT_FACTOR;
+    }
 }
 
 int on_safe_remove(disk_manager* manager)
@@ -117,9 +143,7 @@ int on_safe_remove(disk_manager* manager)
     services_start();
     disk_sets_publish(&manager->disks);
     manager->state = MANAGER_SAFE_REMOVED;
-    if (sys_timeout <= INT32_MAX / SYS_TIMEOUT_FACTOR) {
-        sys_timeout *= SYS_TIMEOUT_FACTOR;
-    }
+    lengthen_sys_timeout();
     return 0;
 }
 
@@ -131,19 +155,19 @@ void publish_when_due(disk_manager* manager, time_t now)
         manager->changed = 0;
         disk_sets_publish(&manager->disks);
     } else if (now - manager->t_publish > PUBLISH_AFTER_SECONDS) {
-        // t_publish stays: with no change for so long the files are written in every idle cycle,
-        // which keeps the free space in them fresh.
+        // t_publish stays on purpose: with no change for so long the files are written in every
+        // idle cycle, which keeps the free space in them fresh.
         disk_sets_publish(&manager->disks);
     }
 }
 
 // Two mounts in one place, or a mount without its device: the daemon's memory cannot be trusted. It
-// starts again with a fresh database.
+// starts again with a fresh database. Both are looked for, since each logs what it finds.
 void check_mount_consistency()
 {
-    const int path_twice = check_mount_path_dup();
-    const int dev_gone = check_mount_dev_exist();
-    if (path_twice == 0 && dev_gone == 0) {
+    const bool path_twice = check_mount_path_dup() != 0;
+    const bool dev_gone = check_mount_dev_exist() != 0;
+    if (!path_twice && !dev_gone) {
         return;
     }
     file_delete(DISK_DB_FILE);
@@ -171,11 +195,27 @@ void do_periodic_work(disk_manager* manager)
         return;
     }
     manager->t_rescan = now;
-    rescan_block_devices(&manager->disks, &manager->changed);
+    // A list that could not be read is tried again next time. The mounts can be checked without it.
+    static_cast<void>(rescan_block_devices(&manager->disks, &manager->changed));
     check_mount_consistency();
 }
 
+// The first mount pass, of what a start-up scan has found.
+void activate(disk_manager* manager, bool mount_known)
+{
+    manager->state = MANAGER_ACTIVE;
+    disk_sets_refresh_sizes(&manager->disks);
+    if (mount_known) {
+        check_disks_mounted(&manager->disks);
+    }
+    mount_all(&manager->disks);
+    disk_sets_publish(&manager->disks);
+}
+
 }  // namespace
+
+constinit std::atomic<int32_t>& running = life.running;
+constinit int32_t& restart_requested = life.restart_requested;
 
 disk_manager* manager_get()
 {
@@ -210,22 +250,18 @@ int manager_scan(disk_manager* manager, int32_t mount_known)
     if (manager == nullptr) {
         return 1;
     }
-    const int have_disk = add_all_disks(&manager->disks);
-    if (have_disk < 0) {
-        return 1;
+    switch (add_all_disks(&manager->disks)) {
+        case SCAN_FAILED:
+            return 1;
+        case SCAN_NO_DISK:
+            // The state stays: docs/limits.md, "Nothing is rescanned before the first disk".
+            disk_status_write_empty_json();
+            return 0;
+        case SCAN_HAS_DISK:
+            activate(manager, mount_known == 1);
+            return 0;
     }
-    if (have_disk == 0) {
-        disk_status_write_empty_json();
-        return 0;
-    }
-    manager->state = MANAGER_ACTIVE;
-    disk_sets_refresh_sizes(&manager->disks);
-    if (mount_known == 1) {
-        check_disks_mounted(&manager->disks);
-    }
-    mount_all(&manager->disks);
-    disk_sets_publish(&manager->disks);
-    return 0;
+    return 1;
 }
 
 int manager_run(disk_manager* manager)
@@ -233,9 +269,12 @@ int manager_run(disk_manager* manager)
     if (manager == nullptr) {
         return 1;
     }
+    // Without the kernel's list there are still the events.
     manager_scan(manager, 0);
     while (running == 1) {
         manager_event_loop(manager);
+        // The loop ends only when running is 0: this tear-down and rebuild happens once, at the
+        // end. Its messages mark the end of the run, and the caller frees the rebuilt manager.
         manager_free(manager);
         if (manager_init(manager) != 0) {
             return 0;
@@ -253,7 +292,7 @@ int manager_event_loop(disk_manager* manager)
     time_t last = time(nullptr);
     while (running == 1) {
         const time_t now = time(nullptr);
-        if (!somebody_is_there(&last, now)) {
+        if (!is_needed(&last, now)) {
             running = 0;
         } else if (receive_event(manager)) {
             last = now;
@@ -263,8 +302,8 @@ int manager_event_loop(disk_manager* manager)
             manager_idle(manager);
         }
     }
-    // What ended the loop is told before the lines of what follows it.
-    signal_inbox_report();
+    // What ended the loop is logged before what follows it.
+    report_signals();
     return 0;
 }
 
@@ -302,7 +341,10 @@ int manager_idle(disk_manager* manager)
     if (manager == nullptr) {
         return 1;
     }
-    switch (manager->state) {
+    switch (static_cast<manager_state>(manager->state)) {
+        case MANAGER_NOT_SET_UP:
+        case MANAGER_INITIALISED:
+            return 0;
         case MANAGER_ACTIVE:
             do_periodic_work(manager);
             return 0;
@@ -310,12 +352,24 @@ int manager_idle(disk_manager* manager)
             log_warn("disk safe remove ...\n");
             pause_seconds(1);
             return 0;
-        default:
-            return 0;
     }
+    return 0;
 }
 
 void loop_run_stop()
 {
     running = 0;
+}
+
+void manager_set_signal_report(void (*report)())
+{
+    life.report_signals = report;
+}
+
+void manager_life_reset()
+{
+    life.running = 1;
+    life.restart_requested = 0;
+    life.sys_timeout = manager_life{}.sys_timeout;
+    life.report_signals = nullptr;
 }

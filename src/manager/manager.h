@@ -2,6 +2,7 @@
 // keeps mounts and status files up to date between them.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <ctime>
 
@@ -27,11 +28,11 @@ struct disk_manager {
     time_t t_rescan;     // last look at /sys/block
 };
 
-// 0 asks the loop to stop, also from the signal handler.
-extern volatile int32_t running;
+// 0 asks the loop to stop, also from the signal handler. At first 1.
+extern std::atomic<int32_t>& running;
 
 // 1 when the daemon is to be started again after its end.
-extern int32_t restart_requested;
+extern int32_t& restart_requested;
 
 // The one manager, never null.
 disk_manager* manager_get();
@@ -49,10 +50,10 @@ int manager_scan(disk_manager* manager, int32_t mount_known);
 // Scan and loop, until the loop is asked to stop.
 int manager_run(disk_manager* manager);
 
-// The loop alone: one event or one idle cycle at a time. 0 when running is 0.
+// The loop alone: one event or one idle cycle at a time, until running is 0. Then 0.
 int manager_event_loop(disk_manager* manager);
 
-// Acts on the current event.
+// Acts on the current event of the manager's pipes. Its result; 1 for a code that is no event.
 int manager_dispatch(disk_manager* manager);
 
 // The work of a cycle without an event.
@@ -60,3 +61,11 @@ int manager_idle(disk_manager* manager);
 
 // Asks the loop to end after its current cycle.
 void loop_run_stop();
+
+// The loop calls report before and after each wait and at its end, when nothing of its work is half
+// done: there the messages of signals may be printed. Null, as at first, for none.
+void manager_set_signal_report(void (*report)());
+
+// Puts what lasts as long as the process back to its beginning: the two flags above, the limit of
+// silence and the report. For tests.
+void manager_life_reset();

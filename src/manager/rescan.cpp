@@ -19,10 +19,13 @@ struct block_names {
     char names[BLOCK_LIST_SIZE][BLOCK_NAME_SIZE];
 };
 
-// The devices seen at the previous rescan.
+// What lasts as long as the process: the devices seen at the previous rescan. The start-up scan
+// leaves it empty, so that the first rescan offers every disk again; the inventory ignores those
+// that it holds.
 block_names block_list;
 
-// More names than slots are left for the rescan that finds room.
+// Longer names are cut. More names than slots are left for the rescan that finds room:
+// docs/limits.md, "Rescans hold 16 block devices".
 bool read_block_names(block_names* list)
 {
     dir_stream dir(SYS_BLOCK);
@@ -52,14 +55,14 @@ bool holds(const block_names& list, const char* name)
 
 }  // namespace
 
-int rescan_block_devices(disk_sets* disks, int32_t* changed)
+bool rescan_block_devices(disk_sets* disks, int32_t* changed)
 {
     block_names found{};
     if (!read_block_names(&found)) {
-        return 1;
+        return false;
     }
-    // Empty slots are compared like names: when a full list shrinks, "" is offered once, and no
-    // device is called that.
+    // Empty slots are compared like names on purpose: when a full list shrinks, "" is offered once,
+    // and no device is called that.
     for (const auto& name : found.names) {
         if (!holds(block_list, name)) {
             disk_sets_add_dev(disks, name);
@@ -73,5 +76,10 @@ int rescan_block_devices(disk_sets* disks, int32_t* changed)
         }
     }
     block_list = found;
-    return 0;
+    return true;
+}
+
+void rescan_reset()
+{
+    block_list = {};
 }

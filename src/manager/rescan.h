@@ -6,5 +6,8 @@
 #include "disk/disk_sets.h"
 
 // Adds the disks that are new since the previous call and removes those that are gone; sets changed
-// when there were any. 0, or 1 when /sys/block cannot be read, and nothing is done.
-int rescan_block_devices(disk_sets* disks, int32_t* changed);
+// when there were any. False when /sys/block cannot be read whole, and nothing is done.
+[[nodiscard]] bool rescan_block_devices(disk_sets* disks, int32_t* changed);
+
+// Forgets the previous call. For tests.
+void rescan_reset();

@@ -18,25 +18,15 @@ constexpr size_t OPTION_SIZE = 32;
 constexpr time_t FIREWALL_PAUSE_SECONDS = 9;
 constexpr char WEBDAV_TARGET[] = "firewall.webdav_wan.target";
 
-constexpr const char* STOP_COMMANDS[] = {
-    "/etc/init.d/samba4 stop",
-    "/etc/init.d/nas_samba3 stop",
-    "/etc/init.d/tarn_nas_sys_dl stop",
-    "/etc/init.d/tarn_nas_sys_up stop",
+// What the firewall rule keeps for the life of the process. Once set the flags stay set: it fires
+// at most once.
+struct firewall_rule {
+    int32_t ser_port_set;
+    int32_t webdav_port_set;
+    time_t t_firewall;  // of the last look
 };
 
-// The same order as stopping, not the reverse: none of them needs another.
-constexpr const char* START_COMMANDS[] = {
-    "/etc/init.d/samba4 start",
-    "/etc/init.d/nas_samba3 start",
-    "/etc/init.d/tarn_nas_sys_dl start",
-    "/etc/init.d/tarn_nas_sys_up start",
-};
-
-// Once set they stay set: the rule fires at most once in the life of the process.
-int32_t ser_port_set = 0;
-int32_t webdav_port_set = 0;
-time_t t_firewall = 0;
+firewall_rule rule;
 
 bool option_is_set(uci_context* ctx, const char* path)
 {
@@ -59,22 +49,23 @@ void accept_webdav(uci_context* ctx, char (&target)[OPTION_SIZE])
     if (!text_has_prefix(target, "DROP")) {
         return;
     }
+    // A change that cannot be written is logged, and not tried again.
     uci2_set(ctx, WEBDAV_TARGET, "ACCEPT");
     uci2_commit(ctx, "firewall");
-    webdav_port_set = 1;
+    rule.webdav_port_set = 1;
     firewall_reload();
 }
 
 void apply_webdav_rule(uci_context* ctx)
 {
     if (option_is_set(ctx, "nas.conf.tarnser_port_set")) {
-        ser_port_set = 1;
+        rule.ser_port_set = 1;
     }
     if (option_is_set(ctx, "nas.conf.webdav_port_set")) {
-        webdav_port_set = 1;
+        rule.webdav_port_set = 1;
         return;
     }
-    if (ser_port_set == 1 || webdav_port_set == 1) {
+    if (rule.ser_port_set == 1 || rule.webdav_port_set == 1) {
         return;
     }
     // Nothing fills it; whoever reads the log expects the line.
@@ -91,25 +82,26 @@ void apply_webdav_rule(uci_context* ctx)
 
 void services_stop()
 {
-    for (const char* command : STOP_COMMANDS) {
-        exec_cmd(command, 1);
+    for (const service_commands& service : FILE_SERVICES) {
+        exec_cmd(service.stop, 1);
     }
 }
 
+// In the order of stopping, not the reverse: none of them needs another.
 void services_start()
 {
-    for (const char* command : START_COMMANDS) {
-        exec_cmd(command, 1);
+    for (const service_commands& service : FILE_SERVICES) {
+        exec_cmd(service.start, 1);
     }
 }
 
 int firewall_webdav_check()
 {
     const time_t now = time(nullptr);
-    if (now - t_firewall <= FIREWALL_PAUSE_SECONDS) {
+    if (now - rule.t_firewall <= FIREWALL_PAUSE_SECONDS) {
         return 0;
     }
-    t_firewall = now;
+    rule.t_firewall = now;
     uci_context* ctx = uci2_new();
     if (ctx == nullptr) {
         log_err("err!\n");
@@ -118,4 +110,9 @@ int firewall_webdav_check()
     apply_webdav_rule(ctx);
     uci2_free(ctx);
     return 0;
+}
+
+void firewall_rule_reset()
+{
+    rule = {};
 }

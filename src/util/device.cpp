@@ -49,7 +49,7 @@ int device_get_sdcard_point(char* out, int size)
 
 int firewall_reload()
 {
-    exec_cmd("/etc/init.d/firewall reload 2>/dev/null", 1);
+    exec_cmd(RELOAD_FIREWALL, 1);
     return 0;
 }
 
@@ -59,7 +59,7 @@ int samba_share_mountd()
     text_format(command, sizeof(command), "uci set samba.@sambashare[-1].path=\"%s\"", MOUNT_BASE);
     exec_cmd(command, 1);
     exec_cmd("uci commit", 1);
-    exec_cmd("/etc/init.d/samba restart", 1);
+    exec_cmd(RESTART_SAMBA, 1);
     return 0;
 }
 

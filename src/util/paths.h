@@ -43,6 +43,26 @@ inline constexpr char SET_ASIDE_TEMPLATE[] = "/tmp/foreign-XXXXXX";
 // An optional program of the router: prints the label of the device named by its argument.
 inline constexpr char LABEL_SCRIPT[] = "/usr/bin/disk_get_label.sh";
 
+// Other processes of the router, and the commands of its init scripts: each stands whole, as the log
+// shows it.
+inline constexpr char COMPANION_PROCESS[] = "tarn_nas_sys";
+inline constexpr char RESTART_DAEMON[] = "/etc/init.d/tarn_nas_diskmanager restart &";
+inline constexpr char RELOAD_FIREWALL[] = "/etc/init.d/firewall reload 2>/dev/null";
+inline constexpr char RESTART_SAMBA[] = "/etc/init.d/samba restart";
+
+struct service_commands {
+    const char* stop;
+    const char* start;
+};
+
+// The services that hold files open on disks, in the order of stopping and of starting.
+inline constexpr service_commands FILE_SERVICES[] = {
+    {"/etc/init.d/samba4 stop", "/etc/init.d/samba4 start"},
+    {"/etc/init.d/nas_samba3 stop", "/etc/init.d/nas_samba3 start"},
+    {"/etc/init.d/tarn_nas_sys_dl stop", "/etc/init.d/tarn_nas_sys_dl start"},
+    {"/etc/init.d/tarn_nas_sys_up stop", "/etc/init.d/tarn_nas_sys_up start"},
+};
+
 // "/dev/%s" of a device name.
 void path_dev_node(char* out, size_t size, const char* dev_name);
 

@@ -6,7 +6,7 @@
 #include <unistd.h>
 
 #include "fuzz.h"
-#include "main/single_instance.h"
+#include "main/run.h"
 #include "util/paths.h"
 
 namespace {

@@ -67,10 +67,10 @@ def test_other_signals_are_only_logged_with_their_number_and_sigpipe_by_name(wor
         mark = daemon.mark()
         daemon.signal(number)
         line = daemon.wait_log(f"*** *** get sig = {int(number)}", 10, since=mark)
-        assert re.fullmatch(r"Warning\[signal_inbox\.cpp:\d+\]\*\*\* \*\*\* get sig = \d+", line)
+        assert re.fullmatch(r"Warning\[signals\.cpp:\d+\]\*\*\* \*\*\* get sig = \d+", line)
     daemon.signal(signal.SIGPIPE)
     line = daemon.wait_log("get sig = SIGPIPE", 10)
-    assert re.fullmatch(r"signal_inbox\.cpp\(\d+\)get sig = SIGPIPE", line)
+    assert re.fullmatch(r"signals\.cpp\(\d+\)get sig = SIGPIPE", line)
 
     world.send("#heart_beat")
     daemon.wait_log("===> get event = EVENT_DISK_HEART_BEAT")

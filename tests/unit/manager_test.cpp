@@ -10,6 +10,7 @@
 
 #include "disk/disk_db.h"
 #include "main/signals.h"
+#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 #include "util/fs_code.h"
 
@@ -115,6 +116,7 @@ protected:
         write_file(DISK_JSON_FILE, "old");
     }
 
+    support::fresh_process process;
     fake_clock clock{NOW};
     disk_manager* manager;
 };
@@ -175,21 +177,19 @@ TEST_F(Manager, a_start_without_disks_writes_the_empty_document_and_leaves_the_c
 
 TEST_F(Manager, after_a_start_without_disks_no_rescan_runs_until_an_add_event)
 {
-    expect_in_child([&] {
-        manager_scan(manager, 0);
-        plug_with_part("sda", 400000);
-        for (int i = 0; i < 5; ++i) {
-            the_clock.now += 100;
-            EXPECT_EQ(manager_idle(manager), 0);
-        }
-        EXPECT_TRUE(stubs.calls().empty());
-        EXPECT_EQ(read_file(DISK_JSON_FILE), EMPTY_JSON);
+    manager_scan(manager, 0);
+    plug_with_part("sda", 400000);
+    for (int i = 0; i < 5; ++i) {
+        the_clock.now += 100;
+        EXPECT_EQ(manager_idle(manager), 0);
+    }
+    EXPECT_TRUE(stubs.calls().empty());
+    EXPECT_EQ(read_file(DISK_JSON_FILE), EMPTY_JSON);
 
-        dispatch(EVENT_DISK_ADD, "sda");
-        EXPECT_EQ(manager->state, 3);
-        manager_idle(manager);
-        EXPECT_TRUE(contains(read_file(DISK_JSON_FILE), "disk1_part1"));
-    });
+    dispatch(EVENT_DISK_ADD, "sda");
+    EXPECT_EQ(manager->state, 3);
+    manager_idle(manager);
+    EXPECT_TRUE(contains(read_file(DISK_JSON_FILE), "disk1_part1"));
 }
 
 TEST_F(Manager, a_start_with_disks_mounts_and_publishes_them)
@@ -297,32 +297,30 @@ TEST_F(Manager, remove_disk_takes_a_directory_name)
 
 TEST_F(Manager, a_safe_removal_unmounts_all_publishes_and_parks_until_the_next_add)
 {
-    expect_in_child([&] {
-        plug_with_part("sda", 400000);
-        manager_scan(manager, 0);
-        stubs.forget_calls();
-        const std::string log =
-            capture_stdout([&] { EXPECT_EQ(dispatch(EVENT_DISK_SAFE_REMOVE, ""), 0); });
-        EXPECT_TRUE(contains(log, "===> safe remove disk\n"));
-        EXPECT_EQ(actions(),
-                  joined({STOP_CALLS,
-                          {"umount /dev/sda1", "umount /tmp/mountd/disk1_part1", "umount /dev/sda"},
-                          START_CALLS}));
-        EXPECT_EQ(manager->state, 4);
-        EXPECT_EQ(read_file(DISK_NUM_FILE), "0");
+    plug_with_part("sda", 400000);
+    manager_scan(manager, 0);
+    stubs.forget_calls();
+    const std::string log =
+        capture_stdout([&] { EXPECT_EQ(dispatch(EVENT_DISK_SAFE_REMOVE, ""), 0); });
+    EXPECT_TRUE(contains(log, "===> safe remove disk\n"));
+    EXPECT_EQ(actions(),
+              joined({STOP_CALLS,
+                      {"umount /dev/sda1", "umount /tmp/mountd/disk1_part1", "umount /dev/sda"},
+                      START_CALLS}));
+    EXPECT_EQ(manager->state, 4);
+    EXPECT_EQ(read_file(DISK_NUM_FILE), "0");
 
-        stubs.forget_calls();
-        the_clock.slept = 0;
-        the_clock.now += 1000;
-        const std::string parked = capture_stdout([&] { EXPECT_EQ(manager_idle(manager), 0); });
-        EXPECT_TRUE(contains(parked, "]disk safe remove ...\n"));
-        EXPECT_EQ(the_clock.slept, 1);
-        EXPECT_TRUE(stubs.calls().empty());
+    stubs.forget_calls();
+    the_clock.slept = 0;
+    the_clock.now += 1000;
+    const std::string parked = capture_stdout([&] { EXPECT_EQ(manager_idle(manager), 0); });
+    EXPECT_TRUE(contains(parked, "]disk safe remove ...\n"));
+    EXPECT_EQ(the_clock.slept, 1);
+    EXPECT_TRUE(stubs.calls().empty());
 
-        dispatch(EVENT_DISK_ADD, "sda");
-        EXPECT_EQ(manager->state, 3);
-        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
-    });
+    dispatch(EVENT_DISK_ADD, "sda");
+    EXPECT_EQ(manager->state, 3);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 1);
 }
 
 TEST_F(Manager, heart_beats_do_nothing_and_unknown_types_answer_1)
@@ -345,20 +343,38 @@ TEST_F(Manager, every_event_that_can_be_parsed_is_acted_on)
     }
 }
 
+TEST_F(Manager, the_state_of_the_process_survives_the_manager_and_ends_with_its_reset)
+{
+    EXPECT_EQ(running, 1);
+    EXPECT_EQ(restart_requested, 0);
+    dispatch(EVENT_DISK_SAFE_REMOVE, "");
+    restart_requested = 1;
+    loop_run_stop();
+    EXPECT_EQ(running, 0);
+    ASSERT_EQ(manager_init(manager), 0);
+    EXPECT_EQ(running, 0);
+    EXPECT_EQ(restart_requested, 1);
+
+    manager_life_reset();
+    EXPECT_EQ(running, 1);
+    EXPECT_EQ(restart_requested, 0);
+    the_clock.step = 61;
+    const std::string log = capture_stdout([&] { manager_event_loop(manager); });
+    EXPECT_TRUE(contains(log, "]sys timeout, 61 > 60\n")) << "the limit is the first one again";
+}
+
 TEST_F(Manager, the_first_idle_cycle_refreshes_updates_publishes_and_rescans_at_once)
 {
-    expect_in_child([&] {
-        plug_with_part("sda", 400000);
-        manager->state = MANAGER_ACTIVE;
-        const std::string log = capture_stdout([&] { manager_idle(manager); });
-        EXPECT_TRUE(contains(log, "=== === ===> update = 1\n")) << "disk.json is missing";
-        EXPECT_EQ(manager->t_refresh, NOW);
-        EXPECT_EQ(manager->t_update, NOW);
-        EXPECT_EQ(manager->t_publish, NOW);
-        EXPECT_EQ(manager->t_rescan, NOW);
-        EXPECT_EQ(manager->changed, 1) << "the rescan found a disk after the publication";
-        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
-    });
+    plug_with_part("sda", 400000);
+    manager->state = MANAGER_ACTIVE;
+    const std::string log = capture_stdout([&] { manager_idle(manager); });
+    EXPECT_TRUE(contains(log, "=== === ===> update = 1\n")) << "disk.json is missing";
+    EXPECT_EQ(manager->t_refresh, NOW);
+    EXPECT_EQ(manager->t_update, NOW);
+    EXPECT_EQ(manager->t_publish, NOW);
+    EXPECT_EQ(manager->t_rescan, NOW);
+    EXPECT_EQ(manager->changed, 1) << "the rescan found a disk after the publication";
+    EXPECT_EQ(disk_sets_count(&manager->disks), 1);
 }
 
 TEST_F(Manager, a_calm_cycle_does_nothing)
@@ -444,59 +460,53 @@ TEST_F(Manager, thirty_seconds_after_the_last_change_every_idle_cycle_publishes)
 
 TEST_F(Manager, the_rescan_and_the_consistency_check_run_every_8_seconds)
 {
-    expect_in_child([&] {
-        make_calm();
-        plug_with_part("sda", 400000);
-        manager->t_rescan = NOW - 7;
-        manager_idle(manager);
-        EXPECT_EQ(manager->t_rescan, NOW - 7);
-        EXPECT_TRUE(stubs.calls().empty());
-        manager->t_rescan = NOW - 8;
-        manager_idle(manager);
-        EXPECT_EQ(manager->t_rescan, NOW);
-        EXPECT_EQ(manager->changed, 1);
-        EXPECT_EQ(disk_sets_count(&manager->disks), 1);
-        EXPECT_EQ(times_called("mount"), 2) << "one look for each of the two checks";
-        EXPECT_EQ(running, 1);
-        EXPECT_EQ(restart_requested, 0);
-    });
+    make_calm();
+    plug_with_part("sda", 400000);
+    manager->t_rescan = NOW - 7;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_rescan, NOW - 7);
+    EXPECT_TRUE(stubs.calls().empty());
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_EQ(manager->t_rescan, NOW);
+    EXPECT_EQ(manager->changed, 1);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 1);
+    EXPECT_EQ(times_called("mount"), 2) << "one look for each of the two checks";
+    EXPECT_EQ(running, 1);
+    EXPECT_EQ(restart_requested, 0);
 }
 
 TEST_F(Manager, a_mounted_device_that_vanished_deletes_the_database_and_asks_for_a_restart)
 {
-    expect_in_child([&] {
-        make_calm();
-        write_file(DISK_DB_FILE, "database");
-        add_mount("/dev/sdq1", "/tmp/mountd/disk1_part1");
-        manager->t_rescan = NOW - 8;
-        manager_idle(manager);
-        EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
-        EXPECT_EQ(running, 0);
-        EXPECT_EQ(restart_requested, 1);
-    });
+    make_calm();
+    write_file(DISK_DB_FILE, "database");
+    add_mount("/dev/sdq1", "/tmp/mountd/disk1_part1");
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
+    EXPECT_EQ(running, 0);
+    EXPECT_EQ(restart_requested, 1);
 }
 
 TEST_F(Manager, two_devices_on_one_path_delete_the_database_and_ask_for_a_restart)
 {
-    expect_in_child([&] {
-        make_calm();
-        write_file(DISK_DB_FILE, "database");
-        for (const char* name : {"sda", "sdb"}) {
-            plug_disk(name, "", 5000);
-            add_mount(std::string("/dev/") + name, "/tmp/mountd/disk1_part1");
-        }
-        manager->t_rescan = NOW - 8;
-        manager_idle(manager);
-        EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
-        EXPECT_EQ(running, 0);
-        EXPECT_EQ(restart_requested, 1);
-        EXPECT_EQ(times_called("mount"), 2) << "both checks run, whatever the first one found";
-    });
+    make_calm();
+    write_file(DISK_DB_FILE, "database");
+    for (const char* name : {"sda", "sdb"}) {
+        plug_disk(name, "", 5000);
+        add_mount(std::string("/dev/") + name, "/tmp/mountd/disk1_part1");
+    }
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
+    EXPECT_EQ(running, 0);
+    EXPECT_EQ(restart_requested, 1);
+    EXPECT_EQ(times_called("mount"), 2) << "both checks run, whatever the first one found";
 }
 
 TEST_F(Manager, 61_seconds_of_silence_with_the_companion_running_warn_and_go_on)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         write_file(support_disk::PIDS_FILE, "321 322\n");
         the_clock.step = 61;
         the_clock.on_look = [&](int look) {
@@ -519,20 +529,18 @@ TEST_F(Manager, 61_seconds_of_silence_with_the_companion_running_warn_and_go_on)
 
 TEST_F(Manager, 60_seconds_of_silence_are_none_and_every_valid_event_resets_them)
 {
-    expect_in_child([&] {
-        the_clock.step = 60;
-        the_clock.on_look = [&](int look) {
-            send("#heart_beat\n");
-            running = look < 6 ? 1 : 0;
-        };
-        EXPECT_EQ(manager_event_loop(manager), 0);
-        EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
-    });
+    the_clock.step = 60;
+    the_clock.on_look = [&](int look) {
+        send("#heart_beat\n");
+        running = look < 6 ? 1 : 0;
+    };
+    EXPECT_EQ(manager_event_loop(manager), 0);
+    EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
 }
 
 TEST_F(Manager, a_cycle_without_an_event_does_not_reset_the_silence)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         the_clock.step = 40;
         the_clock.on_look = [&](int look) {
             if (look == 2) {
@@ -549,7 +557,7 @@ TEST_F(Manager, a_cycle_without_an_event_does_not_reset_the_silence)
 
 TEST_F(Manager, two_safe_removals_raise_the_silence_limit_to_1500_seconds)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         dispatch(EVENT_DISK_SAFE_REMOVE, "");
         dispatch(EVENT_DISK_SAFE_REMOVE, "");
         the_clock.looks = 0;
@@ -570,33 +578,29 @@ TEST_F(Manager, two_safe_removals_raise_the_silence_limit_to_1500_seconds)
 
 TEST_F(Manager, many_safe_removals_do_not_overflow_the_silence_limit)
 {
-    expect_in_child([&] {
-        for (int i = 0; i < 20; ++i) {
-            dispatch(EVENT_DISK_SAFE_REMOVE, "");
-        }
-        the_clock.step = 100000;
-        the_clock.on_look = [&](int look) {
-            send("#heart_beat\n");
-            running = look < 4 ? 1 : 0;
-        };
-        manager_event_loop(manager);
-        EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
-    });
+    for (int i = 0; i < 20; ++i) {
+        dispatch(EVENT_DISK_SAFE_REMOVE, "");
+    }
+    the_clock.step = 100000;
+    the_clock.on_look = [&](int look) {
+        send("#heart_beat\n");
+        running = look < 4 ? 1 : 0;
+    };
+    manager_event_loop(manager);
+    EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
 }
 
 TEST_F(Manager, a_stopped_loop_ends_at_the_top_of_its_cycle)
 {
-    expect_in_child([&] {
-        running = 0;
-        send("#add:sda\n");
-        EXPECT_EQ(manager_event_loop(manager), 0);
-        EXPECT_TRUE(stubs.calls().empty());
-    });
+    running = 0;
+    send("#add:sda\n");
+    EXPECT_EQ(manager_event_loop(manager), 0);
+    EXPECT_TRUE(stubs.calls().empty());
 }
 
 TEST_F(Manager, a_run_scans_once_loops_and_rebuilds_the_manager_once_at_its_end)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         send("#heart_beat\n");
         the_clock.on_look = [](int look) { running = look < 2 ? 1 : 0; };
         EXPECT_EQ(manager_run(manager), 0);
@@ -611,7 +615,7 @@ TEST_F(Manager, a_run_scans_once_loops_and_rebuilds_the_manager_once_at_its_end)
 
 TEST_F(Manager, signals_of_the_last_event_are_told_before_the_manager_is_rebuilt)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         setup_signals();
         send("#add:sda\n");
         the_clock.on_look = [](int look) {

@@ -2,12 +2,13 @@
 
 #include <string>
 
+#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 
+using support::capture_stdout;
 using support::contains;
 using support::read_file;
 using support::write_file;
-using support_disk::expect_in_child;
 using support_disk::fake_clock;
 using support_disk::the_clock;
 
@@ -15,7 +16,6 @@ namespace {
 
 constexpr char RELOAD[] = "/etc/init.d/firewall reload";
 
-// The rule's flags and its last time live as long as the process, so its tests run in a child.
 class FirewallRule : public support_disk::disk_world {
 protected:
     FirewallRule()
@@ -51,6 +51,7 @@ protected:
         EXPECT_EQ(firewall_webdav_check(), 0);
     }
 
+    support::fresh_process process;
     fake_clock clock{1000000};
 };
 
@@ -90,7 +91,7 @@ TEST_F(Services, missing_and_failing_scripts_do_not_end_the_row)
 
 TEST_F(FirewallRule, a_disk_present_turns_drop_into_accept_and_reloads_once_in_the_process)
 {
-    const std::string log = expect_in_child([&] {
+    const std::string log = capture_stdout([&] {
         check_later();
         EXPECT_TRUE(is_accepted()) << read_file("/etc/config/firewall");
         EXPECT_EQ(times_called(RELOAD), 1);
@@ -105,70 +106,61 @@ TEST_F(FirewallRule, a_disk_present_turns_drop_into_accept_and_reloads_once_in_t
 
 TEST_F(FirewallRule, without_a_disk_it_is_not_touched)
 {
-    expect_in_child([&] {
-        for (const char* count : {"0", "", "none", "-1"}) {
-            write_file(DISK_NUM_FILE, count);
-            check_later();
-        }
-        support::remove_all(DISK_NUM_FILE);
+    for (const char* count : {"0", "", "none", "-1"}) {
+        write_file(DISK_NUM_FILE, count);
         check_later();
-        EXPECT_FALSE(is_accepted());
-        EXPECT_EQ(times_called(RELOAD), 0);
-        write_file(DISK_NUM_FILE, "2");
-        check_later();
-        EXPECT_TRUE(is_accepted()) << "and is opened once a disk came";
-    });
+    }
+    support::remove_all(DISK_NUM_FILE);
+    check_later();
+    EXPECT_FALSE(is_accepted());
+    EXPECT_EQ(times_called(RELOAD), 0);
+    write_file(DISK_NUM_FILE, "2");
+    check_later();
+    EXPECT_TRUE(is_accepted()) << "and is opened once a disk came";
 }
 
 TEST_F(FirewallRule, a_target_that_merely_begins_with_drop_counts_as_drop)
 {
-    expect_in_child([&] {
-        set_target("DROPPED");
-        check_later();
-        EXPECT_TRUE(is_accepted());
-    });
+    set_target("DROPPED");
+    check_later();
+    EXPECT_TRUE(is_accepted());
 }
 
 TEST_F(FirewallRule, other_targets_are_left_alone_and_looked_at_again)
 {
-    expect_in_child([&] {
-        for (const char* target : {"REJECT", "drop", "DRO", " DROP"}) {
-            set_target(target);
-            check_later();
-            EXPECT_FALSE(is_accepted()) << target;
-        }
-        set_target("DROP");
+    for (const char* target : {"REJECT", "drop", "DRO", " DROP"}) {
+        set_target(target);
         check_later();
-        EXPECT_TRUE(is_accepted());
-    });
+        EXPECT_FALSE(is_accepted()) << target;
+    }
+    set_target("DROP");
+    check_later();
+    EXPECT_TRUE(is_accepted());
 }
 
 TEST_F(FirewallRule, a_second_call_within_nine_seconds_does_nothing)
 {
-    expect_in_child([&] {
-        set_target("REJECT");
-        check_later();
-        set_target("DROP");
-        the_clock.now += 9;
-        EXPECT_EQ(firewall_webdav_check(), 0);
-        EXPECT_FALSE(is_accepted());
-        the_clock.now += 1;
-        EXPECT_EQ(firewall_webdav_check(), 0);
-        EXPECT_TRUE(is_accepted());
-    });
+    set_target("REJECT");
+    check_later();
+    set_target("DROP");
+    the_clock.now += 9;
+    EXPECT_EQ(firewall_webdav_check(), 0);
+    EXPECT_FALSE(is_accepted());
+    the_clock.now += 1;
+    EXPECT_EQ(firewall_webdav_check(), 0);
+    EXPECT_TRUE(is_accepted());
 }
 
 TEST_F(FirewallRule, either_port_option_of_the_user_keeps_the_rule_away)
 {
-    expect_in_child([&] {
-        set_ports("1", "0");
-        check_later();
-        EXPECT_FALSE(is_accepted());
-        set_ports("0", "0");
-        check_later();
-        EXPECT_FALSE(is_accepted()) << "what was set once stays set in the process";
-    });
-    const std::string log = expect_in_child([&] {
+    set_ports("1", "0");
+    check_later();
+    EXPECT_FALSE(is_accepted());
+    set_ports("0", "0");
+    check_later();
+    EXPECT_FALSE(is_accepted()) << "what was set once stays set in the process";
+    firewall_rule_reset();
+    const std::string log = capture_stdout([&] {
         set_ports("0", "1x");
         check_later();
         EXPECT_FALSE(is_accepted()) << "only the first character counts";
@@ -178,14 +170,11 @@ TEST_F(FirewallRule, either_port_option_of_the_user_keeps_the_rule_away)
 
 TEST_F(FirewallRule, missing_configuration_counts_as_not_set)
 {
-    expect_in_child([&] {
-        support::remove_all("/etc/config/nas");
-        check_later();
-        EXPECT_TRUE(is_accepted());
-    });
-    expect_in_child([&] {
-        support::remove_all("/etc/config/firewall");
-        check_later();
-        EXPECT_EQ(times_called(RELOAD), 1) << "only the call of the child before";
-    });
+    support::remove_all("/etc/config/nas");
+    check_later();
+    EXPECT_TRUE(is_accepted());
+    firewall_rule_reset();
+    support::remove_all("/etc/config/firewall");
+    check_later();
+    EXPECT_EQ(times_called(RELOAD), 1) << "only the call before";
 }

@@ -10,12 +10,11 @@
 
 #include "log/log.h"
 #include "manager/manager.h"
-#include "manager/signal_inbox.h"
+#include "support/process_state.h"
 #include "support/support.h"
-#include "support_disk/child.h"
 
+using support::capture_stdout;
 using support::contains;
-using support_disk::expect_in_child;
 
 namespace {
 
@@ -37,12 +36,18 @@ std::string next_datagram(int fd)
     return length > 0 ? std::string(text, static_cast<size_t>(length)) : "";
 }
 
+class Signals : public testing::Test {
+protected:
+    Signals() { EXPECT_EQ(setup_signals(), 0); }
+
+    support::fresh_process process;
+};
+
 }  // namespace
 
-TEST(Signals, sigterm_has_no_effect)
+TEST_F(Signals, sigterm_has_no_effect)
 {
-    const std::string log = expect_in_child([] {
-        EXPECT_EQ(setup_signals(), 0);
+    const std::string log = capture_stdout([] {
         EXPECT_EQ(raise(SIGTERM), 0);
         EXPECT_EQ(running, 1);
         EXPECT_EQ(signal(SIGTERM, SIG_DFL), SIG_IGN);
@@ -50,10 +55,9 @@ TEST(Signals, sigterm_has_no_effect)
     EXPECT_EQ(log, "");
 }
 
-TEST(Signals, one_sigint_only_logs_and_the_second_stops_the_loop)
+TEST_F(Signals, one_sigint_only_logs_and_the_second_stops_the_loop)
 {
-    const std::string log = expect_in_child([] {
-        setup_signals();
+    const std::string log = capture_stdout([] {
         raise(SIGINT);
         EXPECT_EQ(sigint_count, 1);
         EXPECT_EQ(running, 1);
@@ -62,7 +66,7 @@ TEST(Signals, one_sigint_only_logs_and_the_second_stops_the_loop)
         EXPECT_EQ(running, 0);
         raise(SIGINT);
         EXPECT_EQ(sigint_count, 3);
-        signal_inbox_report();
+        signals_report();
     });
     for (const char* line :
          {"get sig = SIGINT, c = 0\n", "get sig = SIGINT, c = 1\n", "get sig = SIGINT, c = 2\n"}) {
@@ -70,14 +74,13 @@ TEST(Signals, one_sigint_only_logs_and_the_second_stops_the_loop)
     }
 }
 
-TEST(Signals, sigpipe_is_logged_by_name_and_others_as_warnings_by_number)
+TEST_F(Signals, sigpipe_is_logged_by_name_and_others_as_warnings_by_number)
 {
-    const std::string log = expect_in_child([] {
-        setup_signals();
+    const std::string log = capture_stdout([] {
         for (const int sig : {SIGPIPE, SIGUSR1, SIGALRM, SIGHUP, SIGCHLD}) {
             raise(sig);
         }
-        signal_inbox_report();
+        signals_report();
         EXPECT_EQ(running, 1);
     });
     EXPECT_TRUE(contains(log, "get sig = SIGPIPE\n"));
@@ -88,24 +91,23 @@ TEST(Signals, sigpipe_is_logged_by_name_and_others_as_warnings_by_number)
     EXPECT_EQ(support::count_of(log, "Warning["), 4);
 }
 
-TEST(Signals, sigpipe_of_the_daemons_own_writing_is_not_told)
+TEST_F(Signals, sigpipe_of_the_daemons_own_writing_is_not_logged)
 {
-    const std::string log = expect_in_child([] {
-        setup_signals();
+    const std::string log = capture_stdout([] {
         int nobody[2];
         EXPECT_EQ(pipe(nobody), 0);
         close(nobody[0]);
         EXPECT_EQ(write(nobody[1], "x", 1), -1);
         EXPECT_EQ(errno, EPIPE);
-        signal_inbox_report();
+        close(nobody[1]);
+        signals_report();
     });
     EXPECT_EQ(log, "");
 }
 
-TEST(Signals, nothing_is_printed_by_the_handler_itself)
+TEST_F(Signals, nothing_is_printed_by_the_handler_itself)
 {
-    const std::string log = expect_in_child([] {
-        setup_signals();
+    const std::string log = capture_stdout([] {
         for (const int sig : {SIGPIPE, SIGUSR1, SIGUSR2, SIGALRM, SIGHUP, SIGCHLD, SIGINT}) {
             raise(sig);
         }
@@ -113,64 +115,51 @@ TEST(Signals, nothing_is_printed_by_the_handler_itself)
     EXPECT_EQ(log, "");
 }
 
-TEST(Signals, no_signal_is_blocked_afterwards)
+TEST_F(Signals, no_signal_is_blocked_afterwards)
 {
-    expect_in_child([] {
-        sigset_t before;
-        sigset_t after;
-        sigprocmask(SIG_SETMASK, nullptr, &before);
-        setup_signals();
-        raise(SIGHUP);
-        signal_inbox_report();
-        sigprocmask(SIG_SETMASK, nullptr, &after);
-        for (int sig = 1; sig < NSIG; ++sig) {
-            EXPECT_EQ(sigismember(&after, sig), sigismember(&before, sig)) << sig;
-        }
-    });
+    sigset_t before;
+    sigset_t after;
+    sigprocmask(SIG_SETMASK, nullptr, &before);
+    setup_signals();
+    raise(SIGHUP);
+    signals_report();
+    sigprocmask(SIG_SETMASK, nullptr, &after);
+    for (int sig = 1; sig < NSIG; ++sig) {
+        EXPECT_EQ(sigismember(&after, sig), sigismember(&before, sig)) << sig;
+    }
 }
 
-TEST(SignalInbox, tells_every_counted_signal_once)
+TEST_F(Signals, every_signal_that_arrived_is_logged_once)
 {
-    const std::string log = expect_in_child([] {
+    const std::string log = capture_stdout([] {
         for (int i = 0; i < 3; ++i) {
-            signal_inbox_note(SIGHUP);
+            raise(SIGHUP);
         }
-        signal_inbox_note(SIGPIPE);
-        signal_inbox_report();
-        signal_inbox_report();
+        raise(SIGPIPE);
+        signals_report();
+        signals_report();
     });
     EXPECT_EQ(support::count_of(log, "*** *** get sig = 1\n"), 3);
     EXPECT_EQ(support::count_of(log, "get sig = SIGPIPE\n"), 1);
     EXPECT_EQ(support::lines_of(log).size(), 4U) << log;
 }
 
-TEST(SignalInbox, goes_on_counting_sigints_from_report_to_report)
+TEST_F(Signals, sigints_are_numbered_on_from_report_to_report)
 {
-    const std::string log = expect_in_child([] {
-        signal_inbox_note(SIGINT);
-        signal_inbox_report();
-        signal_inbox_note(SIGINT);
-        signal_inbox_report();
+    const std::string log = capture_stdout([] {
+        raise(SIGINT);
+        signals_report();
+        raise(SIGINT);
+        signals_report();
     });
     EXPECT_EQ(support::count_of(log, "get sig = SIGINT, c = 0\n"), 1);
     EXPECT_EQ(support::count_of(log, "get sig = SIGINT, c = 1\n"), 1);
 }
 
-TEST(SignalInbox, keeps_nothing_of_a_signal_that_is_never_told)
+TEST_F(Signals, sigusr2_says_nothing_and_switches_the_copy_to_syslog_on)
 {
-    const std::string log = expect_in_child([] {
-        signal_inbox_note(SIGUSR2);
-        signal_inbox_note(SIGQUIT);
-        signal_inbox_report();
-    });
-    EXPECT_EQ(log, "");
-}
-
-TEST(Signals, sigusr2_says_nothing_and_switches_the_copy_to_syslog_on)
-{
-    const std::string log = expect_in_child([] {
+    const std::string log = capture_stdout([] {
         const int syslog_fd = bind_syslog_socket();
-        setup_signals();
         log_info("before\n");
         EXPECT_EQ(next_datagram(syslog_fd), "");
         raise(SIGUSR2);
@@ -179,17 +168,41 @@ TEST(Signals, sigusr2_says_nothing_and_switches_the_copy_to_syslog_on)
         const std::string copy = next_datagram(syslog_fd);
         EXPECT_TRUE(contains(copy, "tarndisk")) << copy;
         EXPECT_TRUE(contains(copy, "after")) << copy;
+        signals_report();
         support::remove_all("/dev/log");
+        close(syslog_fd);
     });
     EXPECT_EQ(support::lines_of(log).size(), 2U) << log;
 }
 
-TEST(Signals, the_handler_leaves_errno_alone)
+TEST_F(Signals, every_handled_signal_has_the_handler_and_restarts_what_it_interrupts)
 {
-    expect_in_child([] {
-        setup_signals();
-        errno = EXDEV;
+    for (const int sig : {SIGPIPE, SIGUSR1, SIGUSR2, SIGALRM, SIGHUP, SIGCHLD, SIGINT}) {
+        struct sigaction action {};
+        ASSERT_EQ(sigaction(sig, nullptr, &action), 0);
+        EXPECT_EQ(action.sa_flags & (SA_SIGINFO | SA_RESTART), SA_SIGINFO | SA_RESTART) << sig;
+    }
+}
+
+TEST_F(Signals, the_reset_forgets_what_arrived_and_numbers_sigints_from_0)
+{
+    const std::string log = capture_stdout([] {
+        raise(SIGINT);
+        signals_report();
         raise(SIGHUP);
-        EXPECT_EQ(errno, EXDEV);
+        raise(SIGINT);
+        signals_reset();
+        EXPECT_EQ(sigint_count, 0);
+        raise(SIGINT);
+        signals_report();
     });
+    EXPECT_EQ(support::count_of(log, "get sig = SIGINT, c = 0\n"), 2) << log;
+    EXPECT_EQ(support::lines_of(log).size(), 2U) << log;
+}
+
+TEST_F(Signals, the_handler_leaves_errno_alone)
+{
+    errno = EXDEV;
+    raise(SIGHUP);
+    EXPECT_EQ(errno, EXDEV);
 }

@@ -1,4 +1,4 @@
-#include "main/environment.h"
+#include "main/run.h"
 
 #include <unistd.h>
 
@@ -6,14 +6,14 @@
 #include <string>
 
 #include "log/log.h"
-#include "main/block_input.h"
 #include "manager/manager.h"
+#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 
+using support::capture_stdout;
 using support::contains;
 using support::read_file;
 using support::write_file;
-using support_disk::expect_in_child;
 
 namespace {
 
@@ -46,6 +46,18 @@ protected:
         }
         return count;
     }
+
+    support::fresh_process process;
+};
+
+class SingleInstance : public support_disk::disk_world {
+protected:
+    // What pgrep prints.
+    void list_pids(const std::string& text)
+    {
+        write_file("/run/pgrep_output", text);
+        stubs.add("pgrep", "cat /run/pgrep_output");
+    }
 };
 
 }  // namespace
@@ -56,11 +68,9 @@ TEST_F(Environment, the_preparation_makes_pid_file_and_directories_and_takes_the
     write_file("/etc/hotplug.d/block/20-other", "hook");
     support::remove_all("/tmp/tarn_nas");
     support::make_dir("/tmp/log");
-    expect_in_child([] {
-        EXPECT_EQ(init_environment(), 0);
-        EXPECT_EQ(read_file("/tmp/tarn_nas//disk_manager_pid"), std::to_string(getpid()));
-        log_file_close();
-    });
+    EXPECT_EQ(init_environment(), 0);
+    EXPECT_EQ(read_file("/tmp/tarn_nas//disk_manager_pid"), std::to_string(getpid()));
+    log_file_close();
     EXPECT_TRUE(std::filesystem::is_directory("/tmp/mountd"));
     EXPECT_TRUE(std::filesystem::is_directory("/etc/config/tarn_nas"));
     EXPECT_FALSE(std::filesystem::exists("/etc/hotplug.d/block/10-mount"));
@@ -72,10 +82,8 @@ TEST_F(Environment, what_an_earlier_run_left_mounted_is_unmounted_by_force)
 {
     add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
     add_mount("/dev/sdb1", "/mnt");
-    expect_in_child([] {
-        init_environment();
-        log_file_close();
-    });
+    init_environment();
+    log_file_close();
     EXPECT_EQ(actions(), (std::vector<std::string>{"umount -f /dev/sda1",
                                                    "umount -f /tmp/mountd/disk1_part1"}));
 }
@@ -84,10 +92,8 @@ TEST_F(Environment, the_preparation_of_block_input_mode_does_no_more_than_its_ow
 {
     write_file("/etc/hotplug.d/block/10-mount", "hook");
     add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
-    expect_in_child([] {
-        init_block_input_environment();
-        EXPECT_EQ(read_file(PID_FILE), std::to_string(getpid()));
-    });
+    init_block_input_environment();
+    EXPECT_EQ(read_file(PID_FILE), std::to_string(getpid()));
     EXPECT_TRUE(std::filesystem::is_directory("/tmp/mountd"));
     EXPECT_FALSE(std::filesystem::exists("/etc/config/tarn_nas"));
     EXPECT_TRUE(std::filesystem::exists("/etc/hotplug.d/block/10-mount"));
@@ -113,7 +119,7 @@ TEST_F(Environment, block_input_mode_takes_over_what_is_mounted_and_leaves_no_pi
     add_mount("/dev/sda1", "/tmp/mountd/disk4_part2");
     stubs.add("pgrep");
     add_restart_script();
-    const std::string log = expect_in_child([] {
+    const std::string log = capture_stdout([] {
         running = 0;
         EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
     });
@@ -129,11 +135,9 @@ TEST_F(Environment, block_input_mode_takes_over_what_is_mounted_and_leaves_no_pi
 TEST_F(Environment, a_requested_restart_runs_after_the_pid_file_is_gone)
 {
     add_restart_script();
-    expect_in_child([] {
-        running = 0;
-        restart_requested = 1;
-        EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
-    });
+    running = 0;
+    restart_requested = 1;
+    EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
     EXPECT_EQ(wait_for_restart(), "gone\n");
 }
 
@@ -141,8 +145,93 @@ TEST_F(Environment, block_input_mode_ends_with_1_beside_another_instance)
 {
     write_file(PID_FILE, "4123");
     stubs.add("pgrep", "echo 4123");
-    expect_in_child([] { EXPECT_EQ(run_block_input_mode(0, nullptr), 1); });
+    EXPECT_EQ(run_block_input_mode(0, nullptr), 1);
     EXPECT_EQ(read_file(PID_FILE), "4123");
     EXPECT_FALSE(std::filesystem::exists(PIPE_ADD_REMOVE)) << "nothing was created";
     EXPECT_FALSE(std::filesystem::exists("/tmp/mountd"));
+}
+
+TEST_F(SingleInstance, without_a_pid_file_nobody_is_asked)
+{
+    list_pids("1\n");
+    const std::string log = capture_stdout([] { EXPECT_EQ(check_single_instance(), 0); });
+    EXPECT_TRUE(contains(log, "===> pid Not exist, file = /tmp/tarn_nas//disk_manager_pid\n"));
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
+TEST_F(SingleInstance, a_listed_pid_is_another_instance_and_its_file_stays)
+{
+    write_file(PID_FILE, "4123");
+    list_pids("4000\n4123\n");
+    const std::string log = capture_stdout([] { EXPECT_EQ(check_single_instance(), 1); });
+    EXPECT_TRUE(contains(log, "pid sets = 4000\n4123\n\n")) << log;
+    EXPECT_TRUE(contains(log, "cur pid = 4123\n"));
+    EXPECT_TRUE(contains(log, "===> pid exist, file = /tmp/tarn_nas//disk_manager_pid\n"));
+    EXPECT_EQ(read_file(PID_FILE), "4123");
+    EXPECT_EQ(stubs.calls(), std::vector<std::string>{"pgrep -f tarn_nas_diskmanager"});
+}
+
+TEST_F(SingleInstance, a_pid_file_in_somebody_elses_directory_counts_for_nothing)
+{
+    write_file(PID_FILE, "1");
+    ASSERT_EQ(chown("/tmp/tarn_nas", 4711, 4711), 0);
+    list_pids("1\n");
+    EXPECT_EQ(check_single_instance(), 0);
+    EXPECT_FALSE(std::filesystem::exists("/tmp/tarn_nas"));
+    EXPECT_TRUE(stubs.calls().empty());
+}
+
+TEST_F(SingleInstance, a_stale_pid_file_is_deleted_and_start_up_continues)
+{
+    write_file(PID_FILE, "999");
+    list_pids("4000\n4123\n");
+    const std::string log = capture_stdout([] { EXPECT_EQ(check_single_instance(), 0); });
+    EXPECT_TRUE(contains(log, "===> pid Not exist, file = "));
+    EXPECT_FALSE(std::filesystem::exists(PID_FILE));
+}
+
+TEST_F(SingleInstance, a_pid_file_holding_1_is_live_whenever_a_listed_pid_contains_that_digit)
+{
+    write_file(PID_FILE, "1");
+    list_pids("4123\n");
+    EXPECT_EQ(check_single_instance(), 1);
+    list_pids("423\n");
+    EXPECT_EQ(check_single_instance(), 0);
+}
+
+TEST_F(SingleInstance, the_text_of_the_file_is_found_inside_a_longer_pid)
+{
+    write_file(PID_FILE, "12");
+    list_pids("4123\n");
+    EXPECT_EQ(check_single_instance(), 1);
+}
+
+TEST_F(SingleInstance, the_scratch_file_is_deleted_before_and_after)
+{
+    write_file(PID_FILE, "77");
+    write_file(SCRATCH_PGREP, "77\n");
+    stubs.add("pgrep", "exit 1");
+    EXPECT_EQ(check_single_instance(), 0);
+    EXPECT_FALSE(std::filesystem::exists(SCRATCH_PGREP));
+}
+
+TEST_F(SingleInstance, only_the_first_128_bytes_of_the_list_and_32_of_the_file_are_looked_at)
+{
+    write_file(PID_FILE, "77777");
+    list_pids(std::string(128, '1') + "77777\n");
+    EXPECT_EQ(check_single_instance(), 0);
+
+    write_file(PID_FILE, std::string(32, '2') + "999");
+    list_pids(std::string(32, '2') + "\n");
+    EXPECT_EQ(check_single_instance(), 1);
+}
+
+TEST_F(SingleInstance, the_pid_file_holds_the_decimal_pid_and_nothing_else)
+{
+    support::remove_all("/tmp/tarn_nas");
+    write_pid_file();
+    EXPECT_EQ(read_file("/tmp/tarn_nas//disk_manager_pid"), std::to_string(getpid()));
+    write_file(PID_FILE, "a longer text that was here before");
+    write_pid_file();
+    EXPECT_EQ(read_file(PID_FILE), std::to_string(getpid()));
 }
