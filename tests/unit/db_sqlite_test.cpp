@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
-#include <regex>
 
 #include "support/support.h"
 
@@ -161,10 +160,10 @@ TEST_F(Database, FinalizeOfAFailedStatementIsLoggedAndClearsIt)
     EXPECT_NE(sqlite3_step(handle.stmt), SQLITE_DONE);
     std::string log = log_of([&] { EXPECT_EQ(db_finalize(&handle), 1); });
     EXPECT_EQ(handle.stmt, nullptr);
-    EXPECT_TRUE(std::regex_match(
-        log, std::regex("ERROR\\[db_sqlite\\.cpp:N\\]err code = [0-9]+\n"
-                        "db_sqlite\\.cpp\\(N\\)sqlite err code = [0-9]+\n"
-                        "db_sqlite\\.cpp\\(N\\)sqlite err = UNIQUE constraint failed: disk.id\n")))
+    EXPECT_TRUE(support::matches(
+        log, "ERROR\\[db_sqlite\\.cpp:N\\]err code = [0-9]+\n"
+             "db_sqlite\\.cpp\\(N\\)sqlite err code = [0-9]+\n"
+             "db_sqlite\\.cpp\\(N\\)sqlite err = UNIQUE constraint failed: disk.id\n"))
         << log;
 }
 

@@ -65,9 +65,8 @@ TEST(ExecCmd, PrintsTheCommandWithTheCallersFileAndLine)
 
 TEST(ExecCmd, TakesFileAndLineOfItsCallerByItself)
 {
-    std::string text = capture_stdout([] { exec_cmd("true", 1); });
-    EXPECT_TRUE(std::regex_match(text, std::regex(".*exec_test\\.cpp\\(\\d+\\)exec cmd = true\n")))
-        << text;
+    const std::string text = support::log_of([] { exec_cmd("true", 1); });
+    EXPECT_TRUE(text.ends_with("exec_test.cpp(N)exec cmd = true\n")) << text;
 }
 
 TEST(ExecCmd, APercentSignInACommandIsPrintedAsItStands)

@@ -22,39 +22,6 @@ using support_disk::expect_in_child;
 using support_disk::fake_clock;
 using support_disk::the_clock;
 
-// In front of the C library's, for every test of this program.
-extern "C" time_t time(time_t* timer)
-{
-    timespec now{};
-    clock_gettime(CLOCK_REALTIME, &now);
-    time_t result = now.tv_sec;
-    if (the_clock.fake) {
-        ++the_clock.looks;
-        if (the_clock.on_look) {
-            the_clock.on_look(the_clock.looks);
-        }
-        result = the_clock.now;
-        the_clock.now += the_clock.step;
-    }
-    if (timer != nullptr) {
-        *timer = result;
-    }
-    return result;
-}
-
-extern "C" int nanosleep(const timespec* requested_time, timespec* remaining)
-{
-    if (!the_clock.skip_sleeps) {
-        errno = clock_nanosleep(CLOCK_MONOTONIC, 0, requested_time, remaining);
-        return errno == 0 ? 0 : -1;
-    }
-    the_clock.slept += requested_time->tv_sec;
-    if (the_clock.on_sleep) {
-        the_clock.on_sleep();
-    }
-    return 0;
-}
-
 namespace {
 
 constexpr time_t NOW = 1000000;

@@ -1,38 +1,49 @@
-// Things other than ordinary files to meet at a path.
+// Files, directories and other things to meet at a path. "/run" belongs to these helpers.
 #pragma once
 
-#include <gtest/gtest.h>
-#include <sys/socket.h>
-#include <sys/un.h>
-#include <unistd.h>
-
-#include <cstring>
-#include <filesystem>
 #include <string>
+#include <string_view>
 
 namespace support {
 
-// Links are not followed.
-inline bool exists(const std::string& path)
-{
-    return std::filesystem::exists(std::filesystem::symlink_status(path));
-}
+// The file's content; empty when there is none.
+std::string read_file(const std::string& path);
 
-inline void make_link(const std::string& target, const std::string& path)
-{
-    ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
-}
+// Creates or replaces the file, and the directories above it.
+void write_file(const std::string& path, std::string_view content);
+
+// A file that outside programs can run, and the directories above it.
+void write_script(const std::string& path, const std::string& body);
+
+// Creates the directory and those above it.
+void make_dir(const std::string& path);
+
+void make_link(const std::string& target, const std::string& path);
 
 // Something that exists and that open refuses, also to root.
-inline void make_socket(const std::string& path)
-{
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    ASSERT_LT(path.size(), sizeof(address.sun_path));
-    memcpy(address.sun_path, path.c_str(), path.size() + 1);
-    ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-    close(fd);
-}
+void make_socket(const std::string& path);
+
+// Links are not followed.
+bool exists(const std::string& path);
+
+// Takes away a file, link or whole directory; nothing there is fine.
+void remove_all(const std::string& path);
+
+// Takes away what is in a directory of the private world; ends the program when the directory is
+// the machine's own.
+void empty_dir(const std::string& path);
+
+// Puts the working directory back: some of the daemon's calls leave it elsewhere.
+class kept_working_dir {
+public:
+    kept_working_dir();
+    ~kept_working_dir();
+
+    kept_working_dir(const kept_working_dir&) = delete;
+    kept_working_dir& operator=(const kept_working_dir&) = delete;
+
+private:
+    int fd;
+};
 
 }  // namespace support

@@ -1,49 +1,6 @@
-// The test program's own time() and nanosleep(): real unless a test says otherwise. They are
-// defined once, in manager_test.cpp, and stand in front of the C library's.
 #pragma once
 
-#include <ctime>
-#include <functional>
+#include "support/clock.h"
+#include "support/support.h"
 
-namespace support_disk {
-
-struct clock_control {
-    bool fake = false;
-    time_t now = 0;
-    time_t step = 0;                   // added after every look at the clock
-    int looks = 0;                     // calls of time() while the clock is fake
-    std::function<void(int)> on_look;  // told the number of the look, from 1
-    bool skip_sleeps = false;
-    time_t slept = 0;  // seconds asked for while sleeps are skipped
-    std::function<void()> on_sleep;
-};
-
-inline clock_control the_clock;
-
-// Freezes the clock and skips sleeps until the end of the scope.
-struct fake_clock {
-    explicit fake_clock(time_t start)
-    {
-        the_clock = {};
-        the_clock.fake = true;
-        the_clock.now = start;
-        the_clock.skip_sleeps = true;
-    }
-    ~fake_clock() { the_clock = {}; }
-    fake_clock(const fake_clock&) = delete;
-    fake_clock& operator=(const fake_clock&) = delete;
-};
-
-// Skips sleeps alone.
-struct skipped_sleeps {
-    skipped_sleeps()
-    {
-        the_clock = {};
-        the_clock.skip_sleeps = true;
-    }
-    ~skipped_sleeps() { the_clock = {}; }
-    skipped_sleeps(const skipped_sleeps&) = delete;
-    skipped_sleeps& operator=(const skipped_sleeps&) = delete;
-};
-
-}  // namespace support_disk
+namespace support_disk = support;
