@@ -244,22 +244,24 @@ TEST(Log, NothingReachesSyslogBeforeItIsSwitchedOn)
     EXPECT_EQ(sink.next(), "");
 }
 
-TEST(Log, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
+class LogToSyslog : public testing::Test {
+protected:
+    ~LogToSyslog() override { log_reset(); }
+};
+
+TEST_F(LogToSyslog, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
 {
     syslog_socket sink;
     std::string text = capture_stdout([] {
-        EXPECT_EQ(in_child([] {
-                      log_printf(1, "a/m.cpp", 1, "before\n");
-                      log_enable_syslog();
-                      log_printf(1, "a/m.cpp", 2, "one %d\n", 1);
-                      log_printf(2, "a/m.cpp", 3, "two\n");
-                      log_set_debug();
-                      log_printf(3, "a/m.cpp", 4, "three %s\n", "%d");
-                      errno = ENOENT;
-                      log_printf(4, "a/m.cpp", 5, "four\n");
-                      return errno == ENOENT ? 0 : 1;
-                  }),
-                  0);
+        log_printf(1, "a/m.cpp", 1, "before\n");
+        log_enable_syslog();
+        log_printf(1, "a/m.cpp", 2, "one %d\n", 1);
+        log_printf(2, "a/m.cpp", 3, "two\n");
+        log_set_debug();
+        log_printf(3, "a/m.cpp", 4, "three %s\n", "%d");
+        errno = ENOENT;
+        log_printf(4, "a/m.cpp", 5, "four\n");
+        EXPECT_EQ(errno, ENOENT);
     });
     const std::vector<std::string> expected = {"m.cpp(2)one 1", "Warning[m.cpp:3]two",
                                                "ERROR[m.cpp:4]three %d",
@@ -278,46 +280,40 @@ TEST(Log, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
     EXPECT_EQ(support::lines_of(text).size(), 5U);
 }
 
-TEST(Log, AMissingSyslogDisturbsNothing)
+TEST_F(LogToSyslog, AMissingSyslogDisturbsNothing)
 {
     support::remove_all("/dev/log");
     std::string text = capture_stdout([] {
-        EXPECT_EQ(in_child([] {
-                      log_enable_syslog();
-                      errno = EXDEV;
-                      log_printf(1, "m.cpp", 2, "still here\n");
-                      return errno == EXDEV ? 0 : 1;
-                  }),
-                  0);
+        log_enable_syslog();
+        errno = EXDEV;
+        log_printf(1, "m.cpp", 2, "still here\n");
+        EXPECT_EQ(errno, EXDEV);
     });
     EXPECT_EQ(text, "m.cpp(2)still here\n");
 }
 
+// A test that closes the log file itself resets the log behind that.
 class LogFile : public testing::Test {
 protected:
     LogFile() { support::remove_all("/tmp/log"); }
-    ~LogFile() override { support::remove_all("/tmp/log"); }
+    ~LogFile() override
+    {
+        log_file_close();
+        log_reset();
+        support::remove_all("/tmp/log");
+    }
 };
 
 TEST_F(LogFile, IsNamedAfterTheTimeWithoutLeadingZeros)
 {
     support::make_dir("/tmp/log");
-    EXPECT_EQ(in_child([] {
-                  time_t before = time(nullptr);
-                  if (log_file_open() != 0) {
-                      return 1;
-                  }
-                  time_t after = time(nullptr);
-                  std::vector<std::string> files = log_files();
-                  if (files.size() != 1) {
-                      return 2;
-                  }
-                  bool named =
-                      files[0] == dated_log_path(before) || files[0] == dated_log_path(after);
-                  return named ? 0 : 3;
-              }),
-              0);
-    EXPECT_EQ(log_files().size(), 1U);
+    time_t before = time(nullptr);
+    ASSERT_EQ(log_file_open(), 0);
+    time_t after = time(nullptr);
+    std::vector<std::string> files = log_files();
+    ASSERT_EQ(files.size(), 1U);
+    EXPECT_TRUE(files[0] == dated_log_path(before) || files[0] == dated_log_path(after))
+        << files[0];
 }
 
 TEST_F(LogFile, ALinkUnderItsNameIsNotFollowed)
@@ -333,8 +329,7 @@ TEST_F(LogFile, ALinkUnderItsNameIsNotFollowed)
 
 TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
 {
-    std::string text =
-        capture_stdout([] { EXPECT_EQ(in_child([] { return log_file_open(); }), 1); });
+    std::string text = capture_stdout([] { EXPECT_EQ(log_file_open(), 1); });
     EXPECT_TRUE(support::matches(text, "err, file = /tmp/log/disk_log-[0-9]+(-[0-9]+){5}\\.txt\n"))
         << text;
     EXPECT_FALSE(std::filesystem::exists("/tmp/log"));
@@ -342,24 +337,25 @@ TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
 
 TEST_F(LogFile, ClosingAFileThatIsNotOpenSucceeds)
 {
-    EXPECT_EQ(in_child([] { return log_file_close(); }), 0);
+    EXPECT_EQ(log_file_close(), 0);
 }
 
 TEST_F(LogFile, ClosingAnOpenFileSucceeds)
 {
     support::make_dir("/tmp/log");
-    EXPECT_EQ(in_child([] { return log_file_open() + log_file_close(); }), 0);
+    EXPECT_EQ(log_file_open(), 0);
+    EXPECT_EQ(log_file_close(), 0);
+    log_reset();
 }
 
 TEST_F(LogFile, MessagesDoNotReachTheFile)
 {
     support::make_dir("/tmp/log");
     capture_stdout([] {
-        in_child([] {
-            log_file_open();
-            log_err("for standard output\n");
-            return log_file_close();
-        });
+        log_file_open();
+        log_err("for standard output\n");
+        log_file_close();
+        log_reset();
     });
     ASSERT_EQ(log_files().size(), 1U);
     EXPECT_EQ(support::read_file(log_files()[0]), "");
@@ -368,31 +364,24 @@ TEST_F(LogFile, MessagesDoNotReachTheFile)
 TEST_F(LogFile, WritingOpensTheFileAndStandsInItAtOnce)
 {
     support::make_dir("/tmp/log");
-    EXPECT_EQ(in_child([] {
-                  if (log_file_write("one\n") != 0 || log_file_write("two") != 0) {
-                      return 1;
-                  }
-                  return support::read_file(log_files().at(0)) == "one\ntwo" ? 0 : 2;
-              }),
-              0);
+    EXPECT_EQ(log_file_write("one\n"), 0);
+    EXPECT_EQ(log_file_write("two"), 0);
+    EXPECT_EQ(support::read_file(log_files().at(0)), "one\ntwo");
 }
 
 TEST_F(LogFile, WritingWithoutItsDirectoryIsRefused)
 {
-    capture_stdout([] { EXPECT_EQ(in_child([] { return log_file_write("x\n"); }), 1); });
+    capture_stdout([] { EXPECT_EQ(log_file_write("x\n"), 1); });
 }
 
 TEST_F(LogFile, AnExistingFileIsAppendedTo)
 {
     support::make_dir("/tmp/log");
-    EXPECT_EQ(in_child([] {
-                  time_t now = time(nullptr);
-                  for (time_t t = now; t < now + 30; t++) {
-                      support::write_file(dated_log_path(t), "old\n");
-                  }
-                  return log_file_write("new\n");
-              }),
-              0);
+    time_t now = time(nullptr);
+    for (time_t t = now; t < now + 30; t++) {
+        support::write_file(dated_log_path(t), "old\n");
+    }
+    EXPECT_EQ(log_file_write("new\n"), 0);
     int appended = 0;
     for (const std::string& path : log_files()) {
         appended += support::read_file(path) == "old\nnew\n" ? 1 : 0;
@@ -403,17 +392,30 @@ TEST_F(LogFile, AnExistingFileIsAppendedTo)
 TEST_F(LogFile, The1502ndWriteIsRefusedAndWritesNothing)
 {
     support::make_dir("/tmp/log");
-    EXPECT_EQ(in_child([] {
-                  for (int i = 1; i <= 1501; i++) {
-                      if (log_file_write("x\n") != 0) {
-                          return 1;
-                      }
-                  }
-                  return log_file_write("y\n") == 1 && log_file_write("y\n") == 1 ? 0 : 2;
-              }),
-              0);
+    for (int i = 1; i <= 1501; i++) {
+        ASSERT_EQ(log_file_write("x\n"), 0) << i;
+    }
+    EXPECT_EQ(log_file_write("y\n"), 1);
+    EXPECT_EQ(log_file_write("y\n"), 1);
     ASSERT_EQ(log_files().size(), 1U);
     std::string text = support::read_file(log_files()[0]);
     EXPECT_EQ(support::count_of(text, "x\n"), 1501);
     EXPECT_EQ(support::count_of(text, "y"), 0);
+}
+
+TEST_F(LogFile, TheResetSwitchesSyslogOffAndCountsLinesAnew)
+{
+    support::make_dir("/tmp/log");
+    syslog_socket sink;
+    log_enable_syslog();
+    for (int i = 1; i <= 1502; i++) {
+        log_file_write("x\n");
+    }
+    EXPECT_EQ(log_file_write("y\n"), 1);
+    log_file_close();
+
+    log_reset();
+    printed(1, "m.cpp", 1, "quiet\n");
+    EXPECT_EQ(sink.next(), "");
+    EXPECT_EQ(log_file_write("y\n"), 0);
 }

@@ -318,6 +318,7 @@ TEST_F(Manager, the_state_of_the_process_survives_the_manager_and_ends_with_its_
     restart_requested = 1;
     loop_run_stop();
     EXPECT_EQ(running, 0);
+    manager_free(manager);
     ASSERT_EQ(manager_init(manager), 0);
     EXPECT_EQ(running, 0);
     EXPECT_EQ(restart_requested, 1);

@@ -1,11 +1,14 @@
 #include "main/run.h"
 
+#include <fcntl.h>
 #include <unistd.h>
 
 #include <chrono>
+#include <csignal>
 #include <string>
 
 #include "log/log.h"
+#include "main/signals.h"
 #include "manager/manager.h"
 #include "support/process_state.h"
 #include "support_disk/disk_world.h"
@@ -14,6 +17,8 @@ using support::capture_stdout;
 using support::contains;
 using support::read_file;
 using support::write_file;
+using support_disk::fake_clock;
+using support_disk::the_clock;
 
 namespace {
 
@@ -48,6 +53,63 @@ protected:
     }
 
     support::fresh_process process;
+};
+
+// Both kinds of run.
+struct way_to_run {
+    const char* name;
+    int (*run)();
+    int log_files;
+};
+
+constexpr way_to_run WAYS[] = {
+    {"ordinary", run_daemon, 1},
+    {"block input", [] { return run_block_input_mode(0, nullptr); }, 0},
+};
+
+class Run : public Environment {
+protected:
+    Run() : open_before(open_files()) { stubs.add("pgrep"); }
+
+    // One cycle of the loop, which is woken by a message; then running is cleared.
+    void run_one_cycle(const way_to_run& way)
+    {
+        fake_clock clock(1000000);
+        the_clock.on_look = [looks = 0](int) mutable {
+            // Only the loop looks at the clock while the pipes are there.
+            if (!std::filesystem::exists(PIPE_REMOVE)) {
+                return;
+            }
+            send("#heart_beat\n");
+            running = ++looks < 3 ? 1 : 0;
+        };
+        EXPECT_EQ(way.run(), 0) << way.name;
+    }
+
+    static void send(const std::string& message)
+    {
+        const int fd = open(PIPE_ADD_REMOVE, O_WRONLY | O_NONBLOCK | O_CLOEXEC);
+        EXPECT_GE(fd, 0);
+        EXPECT_EQ(write(fd, message.data(), message.size()), static_cast<ssize_t>(message.size()));
+        close(fd);
+    }
+
+    // Open descriptors of log files and pipes.
+    static int open_files()
+    {
+        int count = 0;
+        for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
+            std::error_code gone;
+            const std::string target = std::filesystem::read_symlink(entry.path(), gone);
+            count += contains(target, "/tmp/log/") || contains(target, "/tmp/tarn_nas/") ? 1 : 0;
+        }
+        return count;
+    }
+
+    [[nodiscard]] int left_open() const { return open_files() - open_before; }
+
+private:
+    int open_before;
 };
 
 class SingleInstance : public support_disk::disk_world {
@@ -112,6 +174,93 @@ TEST_F(Environment, a_restart_runs_the_init_script_and_does_not_wait_for_it)
     EXPECT_EQ(stubs.calls(), std::vector<std::string>{"/etc/init.d/tarn_nas_diskmanager restart"});
 }
 
+TEST_F(Run, both_kinds_loop_leave_no_pid_file_and_close_all_that_they_opened)
+{
+    support::make_dir("/tmp/log");
+    add_restart_script();
+    for (const way_to_run& way : WAYS) {
+        manager_life_reset();
+        support::remove_all("/tmp/log");
+        support::make_dir("/tmp/log");
+        const std::string log = capture_stdout([&] { run_one_cycle(way); });
+        EXPECT_TRUE(contains(log, "EVENT_DISK_HEART_BEAT")) << way.name << log;
+        EXPECT_FALSE(std::filesystem::exists(PID_FILE)) << way.name;
+        EXPECT_TRUE(std::filesystem::exists(PIPE_ADD_REMOVE)) << way.name;
+        EXPECT_EQ(log_file_count(), way.log_files) << way.name;
+        EXPECT_EQ(left_open(), 0) << way.name;
+        EXPECT_FALSE(std::filesystem::exists("/run/restarted")) << way.name;
+    }
+}
+
+TEST_F(Run, both_kinds_log_the_signals_of_their_last_work)
+{
+    for (const way_to_run& way : WAYS) {
+        manager_life_reset();
+        signals_reset();
+        const std::string log = capture_stdout([&] {
+            fake_clock clock(1000000);
+            the_clock.on_look = [](int) {
+                raise(SIGINT);
+                running = 0;
+            };
+            EXPECT_EQ(way.run(), 0) << way.name;
+        });
+        EXPECT_TRUE(contains(log, "get sig = SIGINT, c = 0\n")) << way.name << log;
+    }
+}
+
+TEST_F(Run, only_the_ordinary_kind_unmounts_what_is_left_and_closes_a_log_file)
+{
+    support::make_dir("/tmp/log");
+    add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
+    running = 0;
+    ASSERT_EQ(log_file_open(), 0);
+    EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
+    EXPECT_EQ(times_called("umount -f /dev/sda1"), 0);
+    EXPECT_EQ(left_open(), 1);
+    log_file_close();
+
+    running = 0;
+    EXPECT_EQ(run_daemon(), 0);
+    EXPECT_EQ(times_called("umount -f /dev/sda1"), 1);
+    EXPECT_EQ(left_open(), 0);
+}
+
+TEST_F(Run, pipes_that_cannot_be_made_end_both_kinds_with_0_and_without_a_scan)
+{
+    for (const way_to_run& way : WAYS) {
+        support::remove_all("/tmp/tarn_nas");
+        write_file("/tmp/tarn_nas", "in the way");
+        const std::string log = capture_stdout([&] { EXPECT_EQ(way.run(), 0) << way.name; });
+        EXPECT_FALSE(contains(log, "scan path")) << way.name << log;
+    }
+    support::remove_all("/tmp/tarn_nas");
+}
+
+TEST_F(Run, a_requested_restart_of_either_kind_runs_after_the_pid_file_is_gone)
+{
+    for (const way_to_run& way : WAYS) {
+        add_restart_script();
+        running = 0;
+        restart_requested = 1;
+        EXPECT_EQ(way.run(), 0) << way.name;
+        EXPECT_EQ(wait_for_restart(), "gone\n") << way.name;
+    }
+}
+
+TEST_F(Run, either_kind_ends_with_1_beside_another_instance_and_creates_nothing)
+{
+    for (const way_to_run& way : WAYS) {
+        write_file(PID_FILE, "4123");
+        stubs.add("pgrep", "echo 4123");
+        EXPECT_EQ(way.run(), 1) << way.name;
+        EXPECT_EQ(read_file(PID_FILE), "4123");
+        EXPECT_FALSE(std::filesystem::exists(PIPE_ADD_REMOVE)) << way.name;
+        EXPECT_FALSE(std::filesystem::exists("/tmp/mountd")) << way.name;
+        EXPECT_FALSE(std::filesystem::exists("/etc/config/tarn_nas")) << way.name;
+    }
+}
+
 TEST_F(Environment, block_input_mode_takes_over_what_is_mounted_and_leaves_no_pid_file)
 {
     plug_disk("sda", R"(PTTYPE="dos")", 9000);
@@ -130,25 +279,6 @@ TEST_F(Environment, block_input_mode_takes_over_what_is_mounted_and_leaves_no_pi
     EXPECT_FALSE(std::filesystem::exists(PID_FILE));
     EXPECT_FALSE(contains(log, "manager work again!"));
     EXPECT_FALSE(std::filesystem::exists("/run/restarted"));
-}
-
-TEST_F(Environment, a_requested_restart_runs_after_the_pid_file_is_gone)
-{
-    add_restart_script();
-    running = 0;
-    restart_requested = 1;
-    EXPECT_EQ(run_block_input_mode(0, nullptr), 0);
-    EXPECT_EQ(wait_for_restart(), "gone\n");
-}
-
-TEST_F(Environment, block_input_mode_ends_with_1_beside_another_instance)
-{
-    write_file(PID_FILE, "4123");
-    stubs.add("pgrep", "echo 4123");
-    EXPECT_EQ(run_block_input_mode(0, nullptr), 1);
-    EXPECT_EQ(read_file(PID_FILE), "4123");
-    EXPECT_FALSE(std::filesystem::exists(PIPE_ADD_REMOVE)) << "nothing was created";
-    EXPECT_FALSE(std::filesystem::exists("/tmp/mountd"));
 }
 
 TEST_F(SingleInstance, without_a_pid_file_nobody_is_asked)
