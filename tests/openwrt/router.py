@@ -6,6 +6,7 @@ from pathlib import Path
 
 from world import CHECKOUT, wait_for
 from world.events import PIPES
+from world.overlay import overlay
 
 HERE = Path(__file__).resolve().parent
 PACKAGE = "tarn-nas-diskmanager"
@@ -58,7 +59,7 @@ class Router:
         self.world = world
         # Both directories are the machine's own until an overlay covers them.
         self.world.label_script("")
-        self._overlay("/usr/lib")
+        overlay(self.world, "/usr/lib")
         for source in sorted(path for path in root.rglob("*") if path.is_file()):
             target = self.world.path("/" + str(source.relative_to(root)))
             target.parent.mkdir(parents=True, exist_ok=True)
@@ -70,12 +71,6 @@ class Router:
         self.world.write("/usr/lib/functions/procd.sh", (HERE / "router/procd.sh").read_text())
         self.world.write("/usr/lib/procd_supervise", (HERE / "router/procd_supervise").read_text())
         self.world.write("/run/procd/respawn_delay", "1")
-
-    def _overlay(self, directory):
-        upper = "/run/overlay" + directory
-        self.world.run("mkdir", "-p", f"{upper}/upper", f"{upper}/work")
-        self.world.run("mount", "-t", "overlay", "overlay", directory, "-o",
-                       f"lowerdir={directory},upperdir={upper}/upper,workdir={upper}/work")
 
     # The service.
 

@@ -17,6 +17,7 @@ from . import state
 from .built import CHECKOUT, PROGRAM
 from .daemon import Daemon, child_of
 from .events import PIPES, add_messages, remove_messages, write_pipe
+from .overlay import overlay
 from .sysfs import Sysfs
 from .syslog import Syslog
 from .tools import BUSYBOX, COMPANION, LABEL_SCRIPT, Tools, make_busybox
@@ -309,10 +310,7 @@ class World(state.Observed):
 
     def cover_usr_bin(self):
         """Make /usr/bin the world's own to change."""
-        upper = "/run/world/usr-bin"
-        self.run("mkdir", "-p", f"{upper}/upper", f"{upper}/work")
-        self.run("mount", "-t", "overlay", "overlay", "/usr/bin", "-o",
-                 f"lowerdir=/usr/bin,upperdir={upper}/upper,workdir={upper}/work")
+        overlay(self, "/usr/bin")
         if self._busybox:
             shell = self.run("readlink", "-f", "/bin/sh").stdout.strip()
             self.run("mount", "--bind", BUSYBOX, shell)
