@@ -8,35 +8,22 @@
 #include "disk/system_disk.h"
 #include "fs/fs_type.h"
 #include "log/log.h"
+#include "util/blkid.h"
 #include "util/block_dev.h"
 #include "util/device.h"
-#include "util/exec.h"
 #include "util/file.h"
 #include "util/paths.h"
+#include "util/scratch.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr size_t ROOT_DEV_SIZE = 64;
-constexpr int32_t BLKID_TEXT_SIZE = 512;
+constexpr size_t BLKID_TEXT_SIZE = 512 + 1;
 constexpr size_t LINK_TARGET_SIZE = 256;
 constexpr int SDCARD_POINT_SIZE = 16;
 
-// blkid's output for the device, empty when the name must not reach a shell.
-void read_blkid_line(const char* dev_name, const char* dev_path, char (&text)[BLKID_TEXT_SIZE + 1])
-{
-    memset(text, 0, sizeof(text));
-    if (!name_is_shell_safe(dev_name)) {
-        return;
-    }
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_DEV_CHECK);
-    if (exec_cmd_into(command, SCRATCH_DEV_CHECK) < 0) {
-        return;
-    }
-    file_read_buf(SCRATCH_DEV_CHECK, text, BLKID_TEXT_SIZE);
-    file_delete(SCRATCH_DEV_CHECK);
-}
+constexpr scratch_query CHECK_QUERY{SCRATCH_DEV_CHECK, SCRATCH_DELETED};
 
 // The disk of the inventory that owns a partition, added when it is missing; null when there is
 // none.
@@ -163,12 +150,15 @@ int dev_check_blkid(const char* dev_name)
     }
     char dev_path[PATH_SIZE];
     path_dev_node(dev_path, sizeof(dev_path), dev_name);
-    char text[BLKID_TEXT_SIZE + 1];
-    read_blkid_line(dev_name, dev_path, text);
+    char text[BLKID_TEXT_SIZE]{};
+    const bool known =
+        name_is_plain(dev_name) &&
+        scratch_read(CHECK_QUERY, text, "blkid %s > %s", {dev_path, SCRATCH_DEV_CHECK}) &&
+        blkid_knows(text, dev_path);
     log_info("buf = %s\n", text);
     log_info("dev = %s\n", dev_path);
 
-    if (!text_has_prefix(text, dev_path)) {
+    if (!known) {
         log_info("=== ===> dev err, dev = %s\n", dev_path);
         return 1;
     }

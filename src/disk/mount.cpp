@@ -5,6 +5,7 @@
 #include "disk/mount_table.h"
 #include "fs/fs_type.h"
 #include "log/log.h"
+#include "util/command.h"
 #include "util/exec.h"
 #include "util/file.h"
 #include "util/mount_cmd.h"
@@ -30,18 +31,17 @@ void make_mount_dir(const char* mount_path)
 {
     dir_make(mount_path);
     char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "chmod a+wr %s", mount_path);
-    exec_cmd(command, 1);
+    if (command_format(command, "chmod a+wr %s", {mount_path})) {
+        exec_cmd(command, 1);
+    }
 }
 
 void run_mount(const char* format, const char* dev_path, const char* mount_path)
 {
     char command[COMMAND_SIZE];
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wformat-nonliteral"
-    text_format(command, sizeof(command), format, dev_path, mount_path);
-#pragma GCC diagnostic pop
-    exec_cmd(command, 1);
+    if (command_format(command, format, {dev_path, mount_path})) {
+        exec_cmd(command, 1);
+    }
 }
 
 // A userspace filesystem takes its time to appear in the mount table.

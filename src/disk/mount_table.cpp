@@ -5,9 +5,8 @@
 #include <cstring>
 
 #include "log/log.h"
-#include "util/exec.h"
-#include "util/file.h"
 #include "util/paths.h"
+#include "util/scratch.h"
 #include "util/text.h"
 
 namespace {
@@ -15,6 +14,7 @@ namespace {
 constexpr size_t LINE_SIZE = 512;
 constexpr char BLANKS[] = " \n";
 constexpr char DIGITS[] = "0123456789";
+constexpr scratch_query MOUNT_QUERY{SCRATCH_MOUNT, SCRATCH_DELETED_WHEN_READ};
 
 // "%s/disk" of the mount base; of a path only as many characters are skipped, not compared.
 constexpr size_t PATH_PREFIX_LENGTH = sizeof(MOUNT_BASE) - 1 + sizeof("/disk") - 1;
@@ -38,21 +38,15 @@ int read_mount_table(mount_table* table)
         return 1;
     }
     memset(table, 0, sizeof(*table));
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "mount > %s", SCRATCH_MOUNT);
-    const bool listed = exec_cmd_into(command, SCRATCH_MOUNT) >= 0;
-
-    FILE* listing = listed ? fopen(SCRATCH_MOUNT, "re") : nullptr;
-    if (listing == nullptr) {
+    const scratch_lines listing(MOUNT_QUERY, "mount > %s", {SCRATCH_MOUNT});
+    if (listing.stream == nullptr) {
         log_err("err, fn = %s\n", SCRATCH_MOUNT);
         return 1;
     }
     char line[LINE_SIZE];
-    while (fgets(line, sizeof(line), listing) != nullptr) {
+    while (fgets(line, sizeof(line), listing.stream) != nullptr) {
         parse_mount_line(table, line);
     }
-    fclose(listing);
-    file_delete(SCRATCH_MOUNT);
     return 0;
 }
 

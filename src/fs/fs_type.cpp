@@ -9,15 +9,16 @@
 
 #include "fs/fs_probe.h"
 #include "log/log.h"
-#include "util/exec.h"
-#include "util/file.h"
+#include "util/blkid.h"
+#include "util/guard.h"
 #include "util/paths.h"
+#include "util/scratch.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr size_t TYPE_PREFIX_LENGTH = 4;
-constexpr char TYPE_KEY[] = "TYPE=";
+constexpr scratch_query TYPE_QUERY{SCRATCH_BLKID_TYPE, SCRATCH_DELETED_WHEN_READ};
 constexpr char RULE[] = "==========================\n";
 
 struct name_list {
@@ -107,25 +108,17 @@ fs_code fs_type_from_blkid(const char* dev_path)
 
 int fs_blkid_type(const char* dev_path, char* out, size_t size)
 {
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "blkid %s > %s", dev_path, SCRATCH_BLKID_TYPE);
-    if (exec_cmd_into(command, SCRATCH_BLKID_TYPE) < 0) {
+    const scratch_text answer(TYPE_QUERY, "blkid %s > %s", {dev_path, SCRATCH_BLKID_TYPE});
+    if (answer.text == nullptr) {
         return 1;
     }
-    char* text = file_read_all(SCRATCH_BLKID_TYPE);
-    if (text == nullptr) {
+    const blkid_value type = blkid_find(answer.text, "TYPE=", BLKID_QUOTE);
+    if (type.text == nullptr) {
         return 1;
     }
-    // The first match wins, also inside PTTYPE or SEC_TYPE.
-    const char* value = text_quoted_value(text, TYPE_KEY);
-    const bool found = value != nullptr;
-    if (found) {
-        text_copy_n(out, size, value, strcspn(value, "\""));
-        log_info("dev = %s, get type = %s\n", dev_path, out);
-    }
-    free(text);
-    file_delete(SCRATCH_BLKID_TYPE);
-    return found ? 0 : 1;
+    text_copy_n(out, size, type.text, type.length);
+    log_info("dev = %s, get type = %s\n", dev_path, out);
+    return 0;
 }
 
 int dev_has_fs_type(const char* dev_name)

@@ -14,13 +14,16 @@
 #include "util/exec.h"
 #include "util/file.h"
 #include "util/paths.h"
+#include "util/scratch.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr int32_t PID_FILE_TEXT_SIZE = 32;
-constexpr int32_t PID_LIST_SIZE = 128;
+constexpr size_t PID_LIST_SIZE = 128 + 1;
 constexpr size_t PID_TEXT_SIZE = 16;
+constexpr scratch_query PGREP_QUERY{
+    .path = SCRATCH_PGREP, .end = SCRATCH_DELETED, .starts_clear = true};
 
 // In what the two kinds of run differ.
 struct run_kind {
@@ -28,20 +31,6 @@ struct run_kind {
     int (*work)(disk_manager* manager);
     bool has_log_file;
 };
-
-// The pids of all processes whose command line names the daemon, this one included. Empty when they
-// cannot be listed.
-void list_daemon_pids(char (&list)[PID_LIST_SIZE + 1])
-{
-    file_delete(SCRATCH_PGREP);
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "pgrep -f tarn_nas_diskmanager > %s", SCRATCH_PGREP);
-    if (exec_cmd_into(command, SCRATCH_PGREP) < 0) {
-        return;
-    }
-    file_read_buf(SCRATCH_PGREP, list, PID_LIST_SIZE);
-    file_delete(SCRATCH_PGREP);
-}
 
 // A plain substring search on purpose: docs/limits.md, "A stale pid file". An empty one, left by a
 // full /tmp, names no process.
@@ -98,12 +87,14 @@ int check_single_instance()
     }
     char pid_text[PID_FILE_TEXT_SIZE + 1]{};
     file_read_buf(PID_FILE, pid_text, PID_FILE_TEXT_SIZE);
-    char list[PID_LIST_SIZE + 1]{};
-    list_daemon_pids(list);
+    // The pids of all processes whose command line names the daemon, this one included.
+    char list[PID_LIST_SIZE];
+    const bool listed =
+        scratch_read(PGREP_QUERY, list, "pgrep -f tarn_nas_diskmanager > %s", {SCRATCH_PGREP});
     log_info("pid sets = %s\n", list);
     log_info("cur pid = %s\n", pid_text);
 
-    if (is_listed(pid_text, list)) {
+    if (listed && is_listed(pid_text, list)) {
         log_info("===> pid exist, file = %s\n", PID_FILE);
         return 1;
     }

@@ -8,19 +8,22 @@
 #include <initializer_list>
 
 #include "log/log.h"
-#include "util/exec.h"
+#include "util/blkid.h"
 #include "util/file.h"
 #include "util/paths.h"
+#include "util/scratch.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr size_t MIN_NAME_LENGTH = 3;
 constexpr size_t NUMBER_SIZE = 128;
-constexpr int32_t LABEL_TEXT_SIZE = 128;
+constexpr size_t LABEL_TEXT_SIZE = 128 + 1;
 constexpr char LABEL_KEY[] = "LABEL=";
-constexpr char BLKID_FORMAT[] = "blkid /dev/%s > %s";
-constexpr char BLKID_RAW_FORMAT[] = "blkid -d /dev/%s > %s";
+
+constexpr scratch_query VALUE_QUERY{SCRATCH_BLKID_VALUE, SCRATCH_DELETED};
+constexpr scratch_query LABEL_QUERY{
+    .path = SCRATCH_LABEL, .end = SCRATCH_KEPT, .starts_clear = true, .wants_end = true};
 
 // Reads the first line of a sysfs file, without its line end, and closes it. False when the file
 // is not open or has no line.
@@ -41,29 +44,32 @@ uint64_t to_number(const char* text)
     return static_cast<uint64_t>(atoll(text));
 }
 
-void query_blkid(const char* command, const char* dev_name, const char* key, char* out, size_t size)
+// Copies what fits without a zero behind it; out is zero-filled already.
+void copy_bytes(char* out, size_t size, const char* text, size_t length)
+{
+    memcpy(out, text, length < size ? length : size);
+}
+
+void query_blkid(const char* format, const char* dev_name, const char* key, char* out, size_t size)
 {
     memset(out, 0, size);
-    if (exec_cmd_into(command, SCRATCH_BLKID_VALUE) < 0) {
+    const scratch_text answer(VALUE_QUERY, format, {dev_name, SCRATCH_BLKID_VALUE});
+    if (answer.text == nullptr) {
         return;
     }
-    char* text = file_read_all(SCRATCH_BLKID_VALUE);
-    // The key matches anywhere, so a longer key that ends the same and stands first wins.
-    const char* value = text != nullptr ? text_quoted_value(text, key) : nullptr;
-    if (value != nullptr) {
-        const size_t length = strcspn(value, "\" ");
-        memcpy(out, value, length < size ? length : size);
-        log_info("get %s, %s = %.*s\n", dev_name, key, static_cast<int>(size), out);
+    const blkid_value value = blkid_find(answer.text, key, BLKID_WORD_ENDS);
+    if (value.text == nullptr) {
+        return;
     }
-    free(text);
-    file_delete(SCRATCH_BLKID_VALUE);
+    copy_bytes(out, size, value.text, value.length);
+    log_info("get %s, %s = %.*s\n", dev_name, key, static_cast<int>(size), out);
 }
 
 }  // namespace
 
 int dev_name_is_disk(const char* name)
 {
-    if (name == nullptr || strlen(name) < MIN_NAME_LENGTH || !name_is_shell_safe(name)) {
+    if (name == nullptr || strlen(name) < MIN_NAME_LENGTH || !name_is_plain(name)) {
         return 1;
     }
     for (const char* prefix : {"sd", "hd", "mmcblk"}) {
@@ -162,9 +168,7 @@ void blkid_get_value(const char* dev_name, const char* key, char* out, size_t si
         log_err("err!\n");
         return;
     }
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), BLKID_FORMAT, dev_name, SCRATCH_BLKID_VALUE);
-    query_blkid(command, dev_name, key, out, size);
+    query_blkid("blkid /dev/%s > %s", dev_name, key, out, size);
 }
 
 void blkid_get_label(const char* dev_name, char* out, size_t size)
@@ -174,9 +178,7 @@ void blkid_get_label(const char* dev_name, char* out, size_t size)
         return;
     }
     // -d keeps blkid from encoding characters that do not print.
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), BLKID_RAW_FORMAT, dev_name, SCRATCH_BLKID_VALUE);
-    query_blkid(command, dev_name, LABEL_KEY, out, size);
+    query_blkid("blkid -d /dev/%s > %s", dev_name, LABEL_KEY, out, size);
 }
 
 int script_get_label(const char* dev_name, char* out, size_t size)
@@ -189,17 +191,10 @@ int script_get_label(const char* dev_name, char* out, size_t size)
     if (!path_exists(LABEL_SCRIPT)) {
         return 1;
     }
-    file_delete(SCRATCH_LABEL);
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "%s %s > %s", LABEL_SCRIPT, dev_name, SCRATCH_LABEL);
-    if (exec_cmd_into(command, SCRATCH_LABEL) != 0) {
+    char text[LABEL_TEXT_SIZE];
+    if (!scratch_read(LABEL_QUERY, text, "%s %s > %s", {LABEL_SCRIPT, dev_name, SCRATCH_LABEL})) {
         return 1;
     }
-    char text[LABEL_TEXT_SIZE + 1]{};
-    if (file_read_buf(SCRATCH_LABEL, text, LABEL_TEXT_SIZE) != 0) {
-        return 1;
-    }
-    const size_t length = strcspn(text, "\t\n\r");
-    memcpy(out, text, length < size ? length : size);
+    copy_bytes(out, size, text, strcspn(text, "\t\n\r"));
     return 0;
 }

@@ -5,6 +5,7 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/command.h"
 #include "util/exec.h"
 #include "util/paths.h"
 #include "util/text.h"
@@ -12,7 +13,6 @@
 namespace {
 
 constexpr size_t MODEL_SIZE = 32;
-constexpr size_t SHARE_COMMAND_SIZE = 256;
 
 }  // namespace
 
@@ -55,9 +55,10 @@ int firewall_reload()
 
 int samba_share_mountd()
 {
-    char command[SHARE_COMMAND_SIZE];
-    text_format(command, sizeof(command), "uci set samba.@sambashare[-1].path=\"%s\"", MOUNT_BASE);
-    exec_cmd(command, 1);
+    char command[LONG_COMMAND_SIZE];
+    if (command_format(command, "uci set samba.@sambashare[-1].path=\"%s\"", {MOUNT_BASE})) {
+        exec_cmd(command, 1);
+    }
     exec_cmd("uci commit", 1);
     exec_cmd(RESTART_SAMBA, 1);
     return 0;

@@ -10,6 +10,7 @@
 
 #include "log/log.h"
 #include "util/claim.h"
+#include "util/command.h"
 #include "util/exec.h"
 #include "util/guard.h"
 #include "util/text.h"
@@ -243,7 +244,7 @@ int dir_make(const char* path)
     if (path_exists(path)) {
         return 0;
     }
-    const text_guard command(text_join("mkdir -p '", path, "'"));
+    const text_guard command(command_of_word("mkdir -p '%s'", path));
     if (command == nullptr) {
         log_err("err!\n");
         return 1;

@@ -1,25 +1,22 @@
 #include "util/mount_cmd.h"
 
-#include <cstddef>
-
 #include "log/log.h"
+#include "util/command.h"
 #include "util/exec.h"
 #include "util/file.h"
-#include "util/paths.h"
 #include "util/text.h"
 
 namespace {
 
-constexpr size_t UMOUNT_SIZE = 256;
-
 // Anybody who may mount a userspace filesystem chooses names in the mount table.
-bool is_umount_target(const char* target)
+void run_umount(const char* format, const char* target)
 {
-    if (path_is_shell_safe(target)) {
-        return true;
+    char command[LONG_COMMAND_SIZE];
+    if (command_format(command, format, {target})) {
+        exec_cmd(command, 1);
+    } else {
+        log_warn("umount err, target = %s\n", target);
     }
-    log_warn("umount err, target = %s\n", target);
-    return false;
 }
 
 }  // namespace
@@ -35,16 +32,12 @@ int fs_repair(fs_code fs_type, const char* dev_path)
     if (format == NO_TEXT) {
         return 1;
     }
-    if (!path_is_shell_safe(dev_path)) {
-        log_warn("repair err, dev = %s\n", dev_path);
-        return 0;
-    }
     char command[COMMAND_SIZE];
-#pragma GCC diagnostic push
-#pragma GCC diagnostic ignored "-Wformat-nonliteral"
-    text_format(command, sizeof(command), format, dev_path);
-#pragma GCC diagnostic pop
-    exec_cmd(command, 1);
+    if (command_format(command, format, {dev_path})) {
+        exec_cmd(command, 1);
+    } else {
+        log_warn("repair err, dev = %s\n", dev_path);
+    }
     return 0;
 }
 
@@ -80,22 +73,12 @@ int fs_repair_fat(const char* dev_path)
 
 void fs_umount(const char* target)
 {
-    if (!is_umount_target(target)) {
-        return;
-    }
-    char command[UMOUNT_SIZE];
-    text_format(command, sizeof(command), "umount %s", target);
-    exec_cmd(command, 1);
+    run_umount("umount %s", target);
 }
 
 void fs_umount_force(const char* target)
 {
-    if (!is_umount_target(target)) {
-        return;
-    }
-    char command[UMOUNT_SIZE];
-    text_format(command, sizeof(command), "umount -f %s", target);
-    exec_cmd(command, 1);
+    run_umount("umount -f %s", target);
 }
 
 int umount_dir_entries(const char* path)
@@ -109,7 +92,7 @@ int umount_dir_entries(const char* path)
         if (name[0] == '.') {
             continue;
         }
-        char target[UMOUNT_SIZE];
+        char target[LONG_COMMAND_SIZE];
         text_format(target, sizeof(target), "%s/%s", path, name);
         fs_umount(target);
     }

@@ -9,27 +9,6 @@ namespace {
 
 constexpr size_t MOUNT_BASE_LENGTH = sizeof(MOUNT_BASE) - 1;
 
-constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
-                                   "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
-                                   "0123456789._-!";
-
-// What a shell takes as it stands inside a word, beside the characters of names and those of UTF-8.
-constexpr char PATH_PUNCTUATION[] = "/+,:@%=";
-
-bool is_plain_in_path(char c)
-{
-    const bool ascii = static_cast<unsigned char>(c) < 0x80;
-    return !ascii || strchr(NAME_CHARACTERS, c) != nullptr ||
-           strchr(PATH_PUNCTUATION, c) != nullptr;
-}
-
-bool climbs(const char* path)
-{
-    const size_t length = strlen(path);
-    const bool ends_up = length >= 3 && strcmp(path + length - 3, "/..") == 0;
-    return ends_up || strstr(path, "/../") != nullptr;
-}
-
 }  // namespace
 
 void path_dev_node(char* out, size_t size, const char* dev_name)
@@ -89,20 +68,10 @@ bool mount_path_is_usable(const char* path)
     }
     const char* name = path + MOUNT_BASE_LENGTH + 1;
     return name[0] != '\0' && name[0] != '.' && strlen(name) < MOUNT_NAME_SIZE &&
-           name_is_shell_safe(name);
+           name_is_plain(name);
 }
 
-bool name_is_shell_safe(const char* name)
+bool name_is_plain(const char* name)
 {
     return name[strspn(name, NAME_CHARACTERS)] == '\0';
-}
-
-bool path_is_shell_safe(const char* path)
-{
-    for (const char* c = path; *c != '\0'; ++c) {
-        if (!is_plain_in_path(*c)) {
-            return false;
-        }
-    }
-    return !climbs(path);
 }

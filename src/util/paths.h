@@ -6,7 +6,6 @@
 
 constexpr size_t PATH_SIZE = 128;       // buffers for paths below the fixed directories
 constexpr size_t DEV_PATH_SIZE = 64;    // buffers for "/dev/%s" of a record's device name
-constexpr size_t COMMAND_SIZE = 128;    // buffers for shell commands; longer ones are cut
 constexpr size_t MOUNT_NAME_SIZE = 32;  // buffers for directory names below the mount base
 
 // What other programs see. The doubled slashes belong to the names.
@@ -43,8 +42,8 @@ inline constexpr char SET_ASIDE_TEMPLATE[] = "/tmp/foreign-XXXXXX";
 // An optional program of the router: prints the label of the device named by its argument.
 inline constexpr char LABEL_SCRIPT[] = "/usr/bin/disk_get_label.sh";
 
-// Other processes of the router, and the commands of its init scripts: each stands whole, as the log
-// shows it.
+// Other processes of the router, and the commands of its init scripts: each stands whole, as the
+// log shows it.
 inline constexpr char COMPANION_PROCESS[] = "tarn_nas_sys";
 inline constexpr char RESTART_DAEMON[] = "/etc/init.d/tarn_nas_diskmanager restart &";
 inline constexpr char RELOAD_FIREWALL[] = "/etc/init.d/firewall reload 2>/dev/null";
@@ -62,6 +61,12 @@ inline constexpr service_commands FILE_SERVICES[] = {
     {"/etc/init.d/tarn_nas_sys_dl stop", "/etc/init.d/tarn_nas_sys_dl start"},
     {"/etc/init.d/tarn_nas_sys_up stop", "/etc/init.d/tarn_nas_sys_up start"},
 };
+
+// What the names of kernel devices are made of, and those of our own directories. Events and
+// entries with another name are not for us.
+inline constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
+                                          "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                          "0123456789._-!";
 
 // "/dev/%s" of a device name.
 void path_dev_node(char* out, size_t size, const char* dev_name);
@@ -87,13 +92,8 @@ void path_mount_dir(char* out, size_t size, const char* mount_name);
 int mount_path_to_name(const char* mount_path, char* out, size_t size);
 
 // True when path is a directory directly below the mount base whose name fits MOUNT_NAME_SIZE and
-// has only the characters below: what the daemon itself once chose, and not what a damaged database
-// says.
+// is plain: what the daemon itself once chose, and not what a damaged database says.
 bool mount_path_is_usable(const char* path);
 
-// True when name holds nothing but what kernel device names are made of: letters, digits, and the
-// characters . _ - and !. Only such a name may become part of a shell command.
-bool name_is_shell_safe(const char* name);
-
-// True when an absolute path is one plain word to a shell and climbs nowhere ("..").
-bool path_is_shell_safe(const char* path);
+// True when name holds nothing but NAME_CHARACTERS.
+bool name_is_plain(const char* name);

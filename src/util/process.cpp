@@ -3,30 +3,24 @@
 #include <cstdlib>
 
 #include "log/log.h"
-#include "util/exec.h"
-#include "util/file.h"
 #include "util/paths.h"
-#include "util/text.h"
+#include "util/scratch.h"
+
+namespace {
+
+constexpr scratch_query PIDOF_QUERY{
+    .path = SCRATCH_PIDOF, .end = SCRATCH_KEPT, .starts_clear = true};
+
+}  // namespace
 
 int proc_pid_of(const char* name)
 {
-    file_delete(SCRATCH_PIDOF);
-    char command[COMMAND_SIZE];
-    text_format(command, sizeof(command), "pidof %s > %s", name, SCRATCH_PIDOF);
-    if (exec_cmd_into(command, SCRATCH_PIDOF) < 0) {
+    const scratch_text pids(PIDOF_QUERY, "pidof %s > %s", {name, SCRATCH_PIDOF});
+    if (pids.text == nullptr || *pids.text == '\0') {
         return 0;
     }
-    char* text = file_read_all(SCRATCH_PIDOF);
-    if (text == nullptr) {
-        return 0;
-    }
-    int pid = 0;
-    if (text[0] != '\0') {
-        log_info("get app = %s, pid = %s\n", name, text);
-        pid = atoi(text);
-    }
-    free(text);
-    return pid;
+    log_info("get app = %s, pid = %s\n", name, pids.text.held);
+    return atoi(pids.text);
 }
 
 int proc_exists(const char* name)

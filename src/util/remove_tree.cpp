@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "log/log.h"
+#include "util/command.h"
 #include "util/exec.h"
 #include "util/file.h"
 #include "util/guard.h"
@@ -16,12 +17,6 @@
 namespace {
 
 constexpr int REMOVE_TRIES = 3;
-
-// Strangers name the entries of a tree, and these characters keep their meaning inside quotes.
-bool is_quotable(const char* path)
-{
-    return strpbrk(path, "\"$`\\") == nullptr;
-}
 
 bool removed_in_tries(const char* path, int (*remove_call)(const char*))
 {
@@ -61,7 +56,7 @@ int path_rm_rf(const char* path)
     if (path == nullptr) {
         return 1;
     }
-    const text_guard command(is_quotable(path) ? text_join("rm -rf \"", path, "\"") : nullptr);
+    const text_guard command(command_of_word("rm -rf \"%s\"", path));
     const bool done = command != nullptr && exec_cmd(command, 1) == 0;
     if (!done) {
         log_errno("rm err, fn = %s\n", path);

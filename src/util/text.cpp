@@ -44,16 +44,6 @@ bool text_has_prefix(const char* text, const char* prefix)
     return strncmp(text, prefix, strlen(prefix)) == 0;
 }
 
-const char* text_quoted_value(const char* text, const char* key)
-{
-    const char* match = strstr(text, key);
-    if (match == nullptr) {
-        return nullptr;
-    }
-    const char* quote = match + strlen(key);
-    return *quote != '\0' ? quote + 1 : quote;
-}
-
 int str_equal(const char* a, const char* b)
 {
     return strcmp(a, b) == 0 ? 0 : 1;

@@ -18,10 +18,6 @@ char* text_join(const char* a, const char* b, const char* c);
 
 bool text_has_prefix(const char* text, const char* prefix);
 
-// The value behind the first occurrence of key and the quote that follows it; empty when the text
-// ends at the key, null when the key does not occur.
-const char* text_quoted_value(const char* text, const char* key);
-
 // 0 when both have the same length and the same bytes, else 1.
 int str_equal(const char* a, const char* b);
 

@@ -464,9 +464,19 @@ TEST_F(DirMake, TakesAPathOfAnyLength)
 
 TEST_F(DirMake, FailsWhenItsCommandCannotRunToItsEnd)
 {
-    // The shell itself is killed: the path ends the quotes.
-    std::string path = ROOT + "/x' ; kill -KILL $$ ; '";
+    // The shell is killed, also one that gives its process to its only command.
+    support::stub_programs stubs;
+    stubs.add("mkdir",
+              R"x([ "$(cat /proc/$PPID/comm)" = sh ] && kill -KILL $PPID || kill -KILL $$)x");
+    std::string path = ROOT + "/x";
     support::capture_stderr([&] { log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 1); }); });
+    EXPECT_EQ(stubs.calls().size(), 1U);
+}
+
+TEST_F(DirMake, APathThatEndsTheQuotesRunsNothing)
+{
+    std::string path = ROOT + "/x' ; touch /run/harm ; '";
+    EXPECT_EQ(log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 1); }), "ERROR[file.cpp:N]err!\n");
 }
 
 TEST_F(FifoCreateOpen, MakesThePipeForItsOwnerAlone)

@@ -154,34 +154,22 @@ TEST(MountPathToName, IsBoundedByTheBuffer)
     EXPECT_STREQ(out, "1234567");
 }
 
-TEST(NameIsShellSafe, TakesKernelNames)
+TEST(NameIsPlain, TakesKernelNames)
 {
     for (const char* name : {"sda", "sda15", "hdb", "mmcblk0p1", "mmcblk0boot0", "loop0", "dm-0",
                              "nvme0n1", "cciss!c0d0", "md127", "a.b_c", "SDA"}) {
-        EXPECT_TRUE(name_is_shell_safe(name)) << name;
+        EXPECT_TRUE(name_is_plain(name)) << name;
     }
 }
 
-TEST(NameIsShellSafe, RefusesWhatTheShellWouldRead)
+TEST(NameIsPlain, RefusesWhatTheShellWouldRead)
 {
     for (const char* name :
          {"sda1;reboot", "sda 1", "sda1\n", "sda\t1", "$(reboot)", "`reboot`",  "sda1&",
           "sda|cat",     "sda>x", "sda<x",  "sda'",   "sda\"",     "sda\\",     "../sda",
           "/dev/sda",    "sda*",  "sda?",   "[sda]",  "sda{1,2}",  "~sda",      "#sda",
           "sda=1",       "sda:1", "sda,1",  "sda%",   "sda(1)",    "sd\xc3\xa4"}) {
-        EXPECT_FALSE(name_is_shell_safe(name)) << name;
-    }
-}
-
-TEST(PathIsShellSafe, TakesWhatIsOnePlainWord)
-{
-    for (const char* path : {"/dev/sda1", "/tmp/mountd/disk1_part1", "/", "", "/tmp/a+b,c:d@e%f=g",
-                             "/tmp/b\xc3\xbcro", "/tmp/..x", "/tmp/x..", "/tmp/.../y"}) {
-        EXPECT_TRUE(path_is_shell_safe(path)) << path;
-    }
-    for (const char* path : {"/dev/sda1;x", "/tmp/a b", "/tmp/$x", "/tmp/a\\040b", "/tmp/a\n",
-                             "/tmp/mountd/../../overlay", "/tmp/mountd/..", "/tmp/~x", "/tmp/a*"}) {
-        EXPECT_FALSE(path_is_shell_safe(path)) << path;
+        EXPECT_FALSE(name_is_plain(name)) << name;
     }
 }
 

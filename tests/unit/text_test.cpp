@@ -113,16 +113,6 @@ TEST(TextHasPrefix, ComparesFromTheStart)
     EXPECT_FALSE(text_has_prefix("a remove", "remove"));
 }
 
-TEST(TextQuotedValue, StartsBehindTheQuoteOfTheFirstKey)
-{
-    EXPECT_STREQ(text_quoted_value("a UUID=\"1\" UUID=\"2\"", "UUID="), "1\" UUID=\"2\"");
-    EXPECT_STREQ(text_quoted_value("PARTUUID=\"p\"", "UUID="), "p\"");
-    EXPECT_STREQ(text_quoted_value("UUID=\"", "UUID="), "");
-    EXPECT_STREQ(text_quoted_value("UUID=", "UUID="), "");
-    EXPECT_EQ(text_quoted_value("UUID", "UUID="), nullptr);
-    EXPECT_EQ(text_quoted_value("", "UUID="), nullptr);
-}
-
 TEST(StrEqual, WantsTheSameLengthAndTheSameBytes)
 {
     EXPECT_EQ(str_equal("sda", "sda"), 0);
