@@ -1,6 +1,7 @@
 #include "support/text.h"
 
-#include <regex>
+#include <regex.h>
+
 #include <sstream>
 
 namespace support {
@@ -32,15 +33,33 @@ int count_of(const std::string& text, const std::string& part)
 
 bool matches(const std::string& text, const std::string& pattern)
 {
-    return std::regex_match(text, std::regex(pattern));
+    regex_t compiled;
+    if (regcomp(&compiled, ("^(" + pattern + ")$").c_str(), REG_EXTENDED | REG_NOSUB) != 0) {
+        return false;
+    }
+    const bool found = regexec(&compiled, text.c_str(), 0, nullptr, 0) == 0;
+    regfree(&compiled);
+    return found;
 }
 
-std::string without_line_numbers(const std::string& text)
+std::string without_line_numbers(std::string text)
 {
-    static const std::regex plain(R"((\.(?:cpp|h))\(\d+\))");
-    static const std::regex bracketed(R"((\.(?:cpp|h)):\d+\])");
-    const std::string changed = std::regex_replace(text, plain, "$1(N)");
-    return std::regex_replace(changed, bracketed, "$1:N]");
+    struct place {
+        std::string before;
+        char behind;
+    };
+    for (const place& number :
+         {place{".cpp(", ')'}, place{".cpp:", ']'}, place{".h(", ')'}, place{".h:", ']'}}) {
+        for (size_t at = text.find(number.before); at != std::string::npos;
+             at = text.find(number.before, at + 1)) {
+            const size_t start = at + number.before.size();
+            const size_t end = text.find_first_not_of("0123456789", start);
+            if (end != std::string::npos && end > start && text[end] == number.behind) {
+                text.replace(start, end - start, "N");
+            }
+        }
+    }
+    return text;
 }
 
 }  // namespace support
