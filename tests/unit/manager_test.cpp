@@ -10,7 +10,6 @@
 
 #include "disk/disk_db.h"
 #include "main/signals.h"
-#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 #include "util/fs_code.h"
 
@@ -83,7 +82,6 @@ protected:
         write_file(DISK_JSON_FILE, "old");
     }
 
-    support::fresh_process process;
     fake_clock clock{NOW};
     disk_manager* manager;
 };

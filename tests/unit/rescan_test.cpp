@@ -2,7 +2,6 @@
 
 #include <string>
 
-#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 
 using support::capture_stdout;
@@ -33,7 +32,6 @@ protected:
         return disk_sets_find_disk(&sets, name.c_str()) != nullptr;
     }
 
-    support::fresh_process process;
     disk_sets sets{};
 };
 

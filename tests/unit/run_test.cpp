@@ -10,7 +10,6 @@
 #include "log/log.h"
 #include "main/signals.h"
 #include "manager/manager.h"
-#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 
 using support::capture_stdout;
@@ -51,8 +50,6 @@ protected:
         }
         return count;
     }
-
-    support::fresh_process process;
 };
 
 // Both kinds of run.

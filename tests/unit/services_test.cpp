@@ -2,7 +2,6 @@
 
 #include <string>
 
-#include "support/process_state.h"
 #include "support_disk/disk_world.h"
 
 using support::capture_stdout;
@@ -51,7 +50,6 @@ protected:
         EXPECT_EQ(firewall_webdav_check(), 0);
     }
 
-    support::fresh_process process;
     fake_clock clock{1000000};
 };
 

@@ -10,7 +10,6 @@
 
 #include "log/log.h"
 #include "manager/manager.h"
-#include "support/process_state.h"
 #include "support/support.h"
 
 using support::capture_stdout;
@@ -39,8 +38,6 @@ std::string next_datagram(int fd)
 class Signals : public testing::Test {
 protected:
     Signals() { EXPECT_EQ(setup_signals(), 0); }
-
-    support::fresh_process process;
 };
 
 }  // namespace

@@ -1,28 +1,12 @@
 #include "support/disk_world.h"
 
 #include <algorithm>
-#include <filesystem>
 
 #include "support/files.h"
-#include "util/paths.h"
 
 namespace support {
 
 namespace {
-
-// Plain files stand for the nodes of disks; a test's child may have left some.
-void forget_nodes()
-{
-    std::vector<std::filesystem::path> nodes;
-    for (const auto& entry : std::filesystem::directory_iterator("/dev")) {
-        if (entry.symlink_status().type() == std::filesystem::file_type::regular) {
-            nodes.push_back(entry.path());
-        }
-    }
-    for (const auto& node : nodes) {
-        remove_all(node);
-    }
-}
 
 void plug(const std::string& name, const std::string& dir, const std::string& details, uint64_t mib)
 {
@@ -40,17 +24,6 @@ void plug(const std::string& name, const std::string& dir, const std::string& de
 
 disk_world::disk_world()
 {
-    for (const char* dir :
-         {"/sys/block", "/sys/class/block", "/etc/config", "/etc/init.d", "/etc/hotplug.d"}) {
-        empty_dir(dir);
-    }
-    for (const char* path :
-         {"/tmp/tarn_nas", MOUNT_BASE, "/tmp/log", SCRATCH_PGREP, SCRATCH_PIDOF, SCRATCH_MOUNT,
-          SCRATCH_DEV_CHECK, SCRATCH_BLKID_TYPE, SCRATCH_BLKID_VALUE, SCRATCH_LABEL, BLKID_DIR,
-          MOUNTS_FILE, MOUNT_REFUSES, UMOUNT_BUSY, PIDS_FILE, SDCARD_POINT, LABEL_SCRIPT}) {
-        remove_all(path);
-    }
-    forget_nodes();
     make_dir("/tmp/tarn_nas");
     add_stubs();
 }

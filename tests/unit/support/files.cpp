@@ -2,15 +2,11 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <linux/magic.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <sys/vfs.h>
 #include <unistd.h>
 
-#include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -71,18 +67,6 @@ bool exists(const std::string& path)
 void remove_all(const std::string& path)
 {
     std::filesystem::remove_all(path);
-}
-
-void empty_dir(const std::string& path)
-{
-    struct statfs info {};
-    if (statfs(path.c_str(), &info) != 0 || info.f_type != TMPFS_MAGIC) {
-        fprintf(stderr, "%s is not private: start the tests through run_private\n", path.c_str());
-        abort();
-    }
-    for (const auto& entry : std::filesystem::directory_iterator(path)) {
-        remove_all(entry.path());
-    }
 }
 
 kept_working_dir::kept_working_dir() : fd(open(".", O_RDONLY | O_DIRECTORY | O_CLOEXEC)) {}

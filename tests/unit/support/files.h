@@ -29,10 +29,6 @@ bool exists(const std::string& path);
 // Takes away a file, link or whole directory; nothing there is fine.
 void remove_all(const std::string& path);
 
-// Takes away what is in a directory of the private world; ends the program when the directory is
-// the machine's own.
-void empty_dir(const std::string& path);
-
 // Puts the working directory back: some of the daemon's calls leave it elsewhere.
 class kept_working_dir {
 public:
