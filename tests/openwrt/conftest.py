@@ -6,6 +6,7 @@ from pathlib import Path
 
 import pytest
 from openwrt.router import HERE, PACKAGE, Buildroot, Router
+from shared import preload
 
 from world.world import PROGRAM
 
@@ -22,10 +23,10 @@ def stand_in(tmp_path_factory):
 @pytest.fixture
 def make_router(make_world, tmp_path):
     """Function that installs the package around a given daemon on a fresh router."""
-    def make(program):
+    def make(program, full_log=False, environ=None):
         buildroot = Buildroot(tmp_path / "buildroot", program)
-        return Router(make_world(tools="busybox"),
-                      buildroot.install(PACKAGE, f"{PACKAGE}-label"))
+        return Router(make_world(tools="busybox", environ=environ),
+                      buildroot.install(PACKAGE, f"{PACKAGE}-label"), full_log)
     return make
 
 
@@ -36,12 +37,31 @@ def router(make_router, stand_in):
 
 
 @pytest.fixture
-def real_router(make_router):
-    """A router with the real daemon."""
+def real_daemon():
+    """The daemon's binary."""
     program = Path(os.environ.get("TARN_DAEMON") or PROGRAM)
     if not program.exists():
         pytest.skip(f"{program} is not built")
-    return make_router(program)
+    return program
+
+
+@pytest.fixture
+def real_router(make_router, real_daemon):
+    """A router with the real daemon, which logs all that it says."""
+    return make_router(real_daemon, full_log=True)
+
+
+@pytest.fixture
+def hasty_router(make_router, real_daemon, tmp_path):
+    """Function that makes a router whose daemon, and its heart-beat, live some seconds in one."""
+    def make(haste, **options):
+        libraries = preload.build(tmp_path)
+        environ = {"LD_PRELOAD": "/run/world/haste.so", "HASTE": str(haste)}
+        router = make_router(real_daemon, environ=environ, **options)
+        router.world.path("/run/world/haste.so").write_bytes((libraries / "haste.so").read_bytes())
+        router.beat_every(router.beat_interval() // haste)
+        return router
+    return make
 
 
 @pytest.fixture

@@ -4,7 +4,7 @@ import re
 import time
 
 import pytest
-from openwrt.router import INIT, PROG
+from openwrt.router import HELPERS, INIT
 
 from world import wait_for
 from world.state import PID_FILE
@@ -15,16 +15,44 @@ def starts(router):
 
 
 def faults(router):
-    return [call for call in router.procd_calls() if call.startswith("fault")]
+    """Starts that found the old daemon still there."""
+    return [call for call in router.procd_calls() if call == "restart daemon"]
 
 
-def test_start_hands_the_daemon_to_procd_with_respawn_and_both_outputs_logged(router):
+@pytest.mark.parametrize("instance", ["log", "daemon", "heart_beat"])
+def test_start_hands_three_programs_to_procd_with_respawn_and_both_outputs_logged(router, instance):
     router.start()
     calls = router.procd_calls()
-    assert f"set_param command {PROG}" in calls
-    assert "set_param respawn" in calls
-    assert "set_param stdout 1" in calls
-    assert "set_param stderr 1" in calls
+    assert [call for call in calls if call.startswith(f"set_param {instance} command {HELPERS}/")]
+    assert [call for call in calls if call.startswith(f"set_param {instance} respawn")]
+    assert f"set_param {instance} stdout 1" in calls
+    assert f"set_param {instance} stderr 1" in calls
+
+
+def test_what_logs_is_there_before_the_daemon(router):
+    router.start()
+    opened = [call.split()[1] for call in router.procd_calls() if call.startswith("open_instance")]
+    assert opened == ["log", "daemon", "heart_beat"]
+
+
+def test_the_process_that_procd_knows_is_the_daemon(router):
+    assert router.start() == router.instance_pid("daemon")
+
+
+def test_no_other_process_bears_the_name_that_the_daemon_looks_for(router):
+    pid = router.start()
+    wait_for(lambda: router.world.run("pgrep", "-f", "tarn_nas_diskmanager").stdout.split() == [str(pid)],
+             10, "the daemon alone")
+
+
+def test_the_service_runs_as_long_as_its_daemon_does(router):
+    assert router.world.run(INIT, "running", check=False).returncode != 0
+    pid = router.start()
+    assert router.world.run(INIT, "running", check=False).returncode == 0
+    router.world.write("/run/procd/respawn_delay", "100")
+    router.world.run("kill", "-KILL", pid)
+    wait_for(lambda: not router.pids(), 10, "the daemon's end")
+    assert router.world.run(INIT, "running", check=False).returncode != 0
 
 
 def test_procd_kills_later_than_the_script_does(router):
@@ -50,11 +78,11 @@ def test_stop_ends_the_daemon_in_good_order(router):
     assert not router.world.exists(PID_FILE)
 
 
-def test_stop_prints_nothing_and_tells_procd_once(router):
+def test_stop_prints_nothing_and_tells_procd_of_the_daemon_first(router):
     router.start()
     done = router.service("stop")
     assert done.stdout + done.stderr == ""
-    assert kills(router) == ["kill tarn_nas_diskmanager"]
+    assert kills(router) == ["kill tarn_nas_diskmanager daemon", "kill tarn_nas_diskmanager"]
 
 
 def test_stop_without_a_daemon_is_quick_and_quiet(router):
@@ -222,4 +250,4 @@ def test_the_real_daemon_restarts_itself_after_a_failed_consistency_check(real_r
     new = wait_for(lambda: [pid for pid in real_router.pids() if pid != old], 60, "a new daemon")
     time.sleep(8)
     assert real_router.pids() == new
-    assert not [call for call in real_router.procd_calls() if call.startswith("fault")]
+    assert faults(real_router) == []

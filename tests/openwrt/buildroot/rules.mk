@@ -6,6 +6,7 @@ PKG_INSTALL_DIR=$(STAGE)/install
 INSTALL_DIR:=install -d -m0755
 INSTALL_BIN:=install -m0755
 INSTALL_DATA:=install -m0644
+INSTALL_CONF:=install -m0600
 CP:=cp -fpR
 HOST_TAR:=tar
 TARGET_CROSS:=
