@@ -98,9 +98,9 @@ const char* value_text(const uci_ptr& ptr)
 void index_path(char (&out)[UCI_PATH_SIZE], const char* type, int index, const char* option)
 {
     if (option != nullptr) {
-        text_format(out, sizeof(out), "%s[%d].%s", type, index, option);
+        text_format(out, "%s[%d].%s", type, index, option);
     } else {
-        text_format(out, sizeof(out), "%s[%d]", type, index);
+        text_format(out, "%s[%d]", type, index);
     }
 }
 
@@ -108,9 +108,9 @@ void name_path(char (&out)[UCI_PATH_SIZE], const char* package, const char* sect
                const char* option)
 {
     if (option != nullptr) {
-        text_format(out, sizeof(out), "%s.%s.%s", package, section, option);
+        text_format(out, "%s.%s.%s", package, section, option);
     } else {
-        text_format(out, sizeof(out), "%s.%s", package, section);
+        text_format(out, "%s.%s", package, section);
     }
 }
 
@@ -188,13 +188,13 @@ int uci2_free(uci_context* ctx)
 
 int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
 {
-    text_copy(out, size, "");
+    text_copy({out, size}, "");
     const path_copy copy(path);
     uci_ptr ptr;
     if (!look_up_complete(ctx, copy, &ptr)) {
         return -1;
     }
-    text_copy(out, size, value_text(ptr));
+    text_copy({out, size}, value_text(ptr));
     return 0;
 }
 
@@ -363,7 +363,7 @@ int uci2_list_item(uci_context* ctx, const char* path, int index, char* out, siz
     int position = 0;
     for (uci_element* e = first_element(list); e != nullptr; e = next_element(list, e)) {
         if (position++ == index) {
-            text_copy(out, size, e->name);
+            text_copy({out, size}, e->name);
         }
     }
     return 0;

@@ -196,8 +196,8 @@ int db_table_exists(sqlite_handle* handle, const char* table)
         return TABLE_UNKNOWN;
     }
     char query[TABLE_QUERY_SIZE];
-    text_format(query, sizeof(query),
-                "select count(*) from sqlite_master where type='table' and name='%s'", table);
+    text_format(query, "select count(*) from sqlite_master where type='table' and name='%s'",
+                table);
     if (db_prepare(handle, query) != 0) {
         log_err("err!\n");
         return TABLE_UNKNOWN;

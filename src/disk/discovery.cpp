@@ -149,7 +149,7 @@ int dev_check_blkid(const char* dev_name)
         return 1;
     }
     char dev_path[PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), dev_name);
+    path_dev_node(dev_path, dev_name);
     char text[BLKID_TEXT_SIZE]{};
     const bool known =
         name_is_plain(dev_name) &&
@@ -172,7 +172,7 @@ void disk_obj_scan_parts(disk_obj* disk)
         return;
     }
     char path[PATH_SIZE];
-    path_sys_disk(path, sizeof(path), disk->root.dev_name);
+    path_sys_disk(path, disk->root.dev_name);
     log_info("check path = %s\n", path);
     dir_stream dir(path);
     if (dir.stream == nullptr) {
@@ -196,7 +196,7 @@ void disk_obj_detect_sd_card(disk_obj* disk)
         return;
     }
     char path[PATH_SIZE];
-    path_sys_disk(path, sizeof(path), disk->root.dev_name);
+    path_sys_disk(path, disk->root.dev_name);
     char target[LINK_TARGET_SIZE + 1]{};
     if (readlink(path, target, LINK_TARGET_SIZE) < 0) {
         text_clear(target);

@@ -59,8 +59,8 @@ void fill_words(char (&out)[STATEMENT_SIZE], const char* shown, std::span<const 
     const char* word = TABLE;
     size_t used = 0;
     while (const char* mark = strstr(shown, "%s")) {
-        text_format(out + used, sizeof(out) - used, "%.*s%s", static_cast<int>(mark - shown), shown,
-                    word);
+        text_format({out + used, sizeof(out) - used}, "%.*s%s", static_cast<int>(mark - shown),
+                    shown, word);
         used += strlen(out + used);
         shown = mark + strlen("%s");
         if (!values.empty()) {
@@ -68,7 +68,7 @@ void fill_words(char (&out)[STATEMENT_SIZE], const char* shown, std::span<const 
             values = values.subspan(1);
         }
     }
-    text_copy(out + used, sizeof(out) - used, shown);
+    text_copy({out + used, sizeof(out) - used}, shown);
 }
 
 template <size_t N>
@@ -177,7 +177,7 @@ int disk_table_create(sqlite_handle* handle)
         return 0;
     }
     char sql[STATEMENT_SIZE];
-    text_format(sql, sizeof(sql), CREATE_TABLE, TABLE);
+    text_format(sql, CREATE_TABLE, TABLE);
     log_info("len = %d, sql = \n%s\n", static_cast<int>(strlen(sql)), sql);
     if (db_exec(handle, sql) != 0) {
         log_err("err!\n");

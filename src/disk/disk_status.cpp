@@ -157,7 +157,7 @@ int disk_status_write_count(const disk_sets* sets)
         return 1;
     }
     char text[COUNT_SIZE];
-    text_format(text, sizeof(text), "%d", disk_sets_count(sets));
+    text_format(text, "%d", disk_sets_count(sets));
     return write_text(DISK_NUM_FILE, text);
 }
 

@@ -22,8 +22,8 @@ void plan_mount_path(part_info* part)
 {
     const int32_t disk_number = part->ref_root != nullptr ? part->ref_root->mount_point_num : 0;
     const int32_t part_number = part->is_root_part == 1 ? ROOT_PART_NUMBER : part->mount_point_num;
-    path_mount_name(part->disk_name, sizeof(part->disk_name), disk_number, part_number);
-    path_mount_dir(part->mount_path, sizeof(part->mount_path), part->disk_name);
+    path_mount_name(part->disk_name, disk_number, part_number);
+    path_mount_dir(part->mount_path, part->disk_name);
     log_info("mout path = %s\n", part->mount_path);
 }
 
@@ -174,7 +174,7 @@ void mount_part(part_info* part)
         return;
     }
     char dev_path[DEV_PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    path_dev_node(dev_path, part->dev_name);
     // Without a name it is not published: what somebody else has mounted is not ours to offer. See
     // "A device that is mounted already" in docs/limits.md.
     text_clear(part->disk_name);

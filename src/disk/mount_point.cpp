@@ -95,8 +95,8 @@ int32_t get_mount_point_num(const disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
-    // A table that cannot be read counts as empty: the disk needs a number now, and mount_part looks
-    // again before it mounts.
+    // A table that cannot be read counts as empty: the disk needs a number now, and mount_part
+    // looks again before it mounts.
     mount_table table;
     read_mount_table(&table);
 
@@ -164,7 +164,7 @@ int check_part_mounted(part_info* part)
         return 1;
     }
     char dev_path[PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    path_dev_node(dev_path, part->dev_name);
     if (get_dev_mount_path(dev_path, part->mount_path) != 1) {
         return 0;
     }

@@ -67,8 +67,8 @@ int parse_mount_line(mount_table* table, const char* line)
     }
     const int32_t index = table->num;
     mount_entry* entry = &table->entries[index];
-    text_copy_n(entry->dev, sizeof(entry->dev), line, strcspn(line, BLANKS));
-    text_copy_n(entry->path, sizeof(entry->path), path, strcspn(path, BLANKS));
+    text_copy_n(entry->dev, line, strcspn(line, BLANKS));
+    text_copy_n(entry->path, path, strcspn(path, BLANKS));
     parse_mount_point_num(entry->path, &entry->main, &entry->sub);
     log_info("get dev mount[%d] %s ==> %s\n", index, entry->dev, entry->path);
     log_info("mount pont[%d] main = %d, sub = %d\n", index, entry->main, entry->sub);
@@ -157,7 +157,7 @@ int get_dev_mount_path(const char* dev_path, char* out)
         }
         mounted = 1;
         if (out != nullptr) {
-            text_copy(out, MOUNT_PATH_SIZE, entry->path);
+            text_copy({out, MOUNT_PATH_SIZE}, entry->path);
         }
     }
     return mounted;

@@ -21,9 +21,9 @@ unsigned long long printable(uint64_t number)
 
 void fill_uid(part_info* part)
 {
-    blkid_get_value(part->dev_name, "UUID=", part->uid, sizeof(part->uid) - 1);
+    blkid_get_value(part->dev_name, "UUID=", part->uid);
     if (part->uid[0] == '\0') {
-        blkid_get_value(part->dev_name, "PARTUUID=", part->uid, sizeof(part->uid) - 1);
+        blkid_get_value(part->dev_name, "PARTUUID=", part->uid);
     }
 }
 
@@ -35,16 +35,16 @@ bool is_factory_label(const part_info* part)
 
 void fill_label(part_info* part)
 {
-    blkid_get_value(part->dev_name, "LABEL=", part->label, sizeof(part->label) - 1);
+    blkid_get_value(part->dev_name, "LABEL=", part->label);
     if (strlen(part->label) <= 1 || is_factory_label(part)) {
         text_copy(part->label, part->dev_name);
         return;
     }
     // blkid's value is cut at a space; the script's is not.
     text_clear(part->label);
-    if (script_get_label(part->dev_name, part->label, sizeof(part->label) - 1) != 0) {
+    if (script_get_label(part->dev_name, part->label) != 0) {
         text_clear(part->label);
-        blkid_get_label(part->dev_name, part->label, sizeof(part->label) - 1);
+        blkid_get_label(part->dev_name, part->label);
     }
     if (part->label[0] == '\0') {
         text_copy(part->label, part->dev_name);
@@ -80,7 +80,7 @@ int part_info_fill(part_info* part)
         return 1;
     }
     char dev_path[PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    path_dev_node(dev_path, part->dev_name);
     if (part->is_root_part == 1) {
         fill_whole_disk(part, dev_path);
     } else {

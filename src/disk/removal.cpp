@@ -54,7 +54,7 @@ void umount_part(const part_info* part)
     }
     log_warn("==> umount dev = %s\n", part->dev_name);
     char dev_path[DEV_PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), part->dev_name);
+    path_dev_node(dev_path, part->dev_name);
     if (part->dev_name[0] != '\0') {
         fs_umount(dev_path);
     }

@@ -11,7 +11,7 @@ namespace {
 bool is_system_device(const char* dev_name)
 {
     char dev_path[PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), dev_name);
+    path_dev_node(dev_path, dev_name);
     struct stat node {};
     if (stat(dev_path, &node) != 0 || !S_ISBLK(node.st_mode)) {
         return false;
@@ -33,7 +33,7 @@ bool is_system_disk(const char* root_dev)
         return true;
     }
     char path[PATH_SIZE];
-    path_sys_disk(path, sizeof(path), root_dev);
+    path_sys_disk(path, root_dev);
     dir_stream dir(path);
     if (dir.stream == nullptr) {
         return false;

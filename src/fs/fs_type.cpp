@@ -116,7 +116,7 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
     if (type.text == nullptr) {
         return 1;
     }
-    text_copy_n(out, size, type.text, type.length);
+    text_copy_n({out, size}, type.text, type.length);
     log_info("dev = %s, get type = %s\n", dev_path, out);
     return 0;
 }
@@ -124,7 +124,7 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
 int dev_has_fs_type(const char* dev_name)
 {
     char dev_path[DEV_PATH_SIZE];
-    path_dev_node(dev_path, sizeof(dev_path), dev_name);
+    path_dev_node(dev_path, dev_name);
     char type[FS_TYPE_TEXT_SIZE]{};
     return fs_blkid_type(dev_path, type, sizeof(type)) == 0 ? 1 : 0;
 }

@@ -19,7 +19,7 @@
 
 namespace {
 
-constexpr int32_t PID_FILE_TEXT_SIZE = 32;
+constexpr size_t PID_FILE_TEXT_SIZE = 32 + 1;
 constexpr size_t PID_LIST_SIZE = 128 + 1;
 constexpr size_t PID_TEXT_SIZE = 16;
 constexpr scratch_query PGREP_QUERY{
@@ -85,8 +85,8 @@ int check_single_instance()
         log_info("===> pid Not exist, file = %s\n", PID_FILE);
         return 0;
     }
-    char pid_text[PID_FILE_TEXT_SIZE + 1]{};
-    file_read_buf(PID_FILE, pid_text, PID_FILE_TEXT_SIZE);
+    char pid_text[PID_FILE_TEXT_SIZE];
+    file_read_text(PID_FILE, pid_text);
     // The pids of all processes whose command line names the daemon, this one included.
     char list[PID_LIST_SIZE];
     const bool listed =
@@ -109,7 +109,7 @@ void write_pid_file()
         return;
     }
     char text[PID_TEXT_SIZE];
-    text_format(text, sizeof(text), "%d", static_cast<int>(getpid()));
+    text_format(text, "%d", static_cast<int>(getpid()));
     file_write(PID_FILE, text, static_cast<int32_t>(strlen(text)));
 }
 

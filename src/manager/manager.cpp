@@ -315,7 +315,7 @@ int manager_dispatch(disk_manager* manager)
     const disk_event* event = &manager->pipes.event;
     log_info("===> get event = %s\n", event_name(event->type));
     char name[EVENT_NAME_SIZE + 1];
-    text_copy_n(name, sizeof(name), event->dev_name, EVENT_NAME_SIZE);
+    text_copy_n(name, event->dev_name, EVENT_NAME_SIZE);
 
     switch (event->type) {
         case EVENT_DISK_ADD:

@@ -37,8 +37,8 @@ bool option_is_set(uci_context* ctx, const char* path)
 
 int published_disk_count()
 {
-    char text[OPTION_SIZE + 1]{};
-    file_read_buf(DISK_NUM_FILE, text, OPTION_SIZE);
+    char text[OPTION_SIZE + 1];
+    file_read_text(DISK_NUM_FILE, text);
     return atoi(text);
 }
 

@@ -10,6 +10,7 @@
 #include "log/log.h"
 #include "util/blkid.h"
 #include "util/file.h"
+#include "util/guard.h"
 #include "util/paths.h"
 #include "util/scratch.h"
 #include "util/text.h"
@@ -25,27 +26,25 @@ constexpr scratch_query VALUE_QUERY{SCRATCH_BLKID_VALUE, SCRATCH_DELETED};
 constexpr scratch_query LABEL_QUERY{
     .path = SCRATCH_LABEL, .end = SCRATCH_KEPT, .starts_clear = true, .wants_end = true};
 
-// Reads the first line of a sysfs file, without its line end, and closes it. False when the file
-// is not open or has no line.
-bool read_line_and_close(FILE* file, char (&text)[NUMBER_SIZE])
+// The number in the first line of a sysfs file; its text, without the line end, is logged.
+struct sysfs_number {
+    char text[NUMBER_SIZE];
+    uint64_t value;
+};
+
+// False when the file is not open or has no line.
+bool read_number(FILE* file, sysfs_number* number)
 {
-    if (file == nullptr) {
+    if (file == nullptr || fgets(number->text, sizeof(number->text), file) == nullptr) {
         return false;
     }
-    char line[NUMBER_SIZE]{};
-    const bool found = fgets(line, sizeof(line), file) != nullptr;
-    fclose(file);
-    text_copy_n(text, sizeof(text), line, strcspn(line, "\r\n"));
-    return found;
+    number->text[strcspn(number->text, "\r\n")] = '\0';
+    number->value = static_cast<uint64_t>(atoll(number->text));
+    return true;
 }
 
-uint64_t to_number(const char* text)
-{
-    return static_cast<uint64_t>(atoll(text));
-}
-
-// Copies what fits without a zero behind it; out is zero-filled already.
-void copy_bytes(char* out, size_t size, const char* text, size_t length)
+// A value as long as out leaves no zero in it; out is zero-filled already.
+void copy_value(char* out, size_t size, const char* text, size_t length)
 {
     memcpy(out, text, length < size ? length : size);
 }
@@ -61,7 +60,7 @@ void query_blkid(const char* format, const char* dev_name, const char* key, char
     if (value.text == nullptr) {
         return;
     }
-    copy_bytes(out, size, value.text, value.length);
+    copy_value(out, size, value.text, value.length);
     log_info("get %s, %s = %.*s\n", dev_name, key, static_cast<int>(size), out);
 }
 
@@ -97,10 +96,10 @@ int sys_block_find_parent(const char* part_name, char* out, size_t size)
             continue;
         }
         char path[PATH_SIZE];
-        path_sys_disk(path, sizeof(path), disk_name);
+        path_sys_disk(path, disk_name);
         if (dir_has_entry(path, part_name) == 0) {
             log_info("find dev = %s, in root path = %s\n", part_name, path);
-            text_copy(out, size, disk_name);
+            text_copy({out, size}, disk_name);
             return 0;
         }
     }
@@ -110,35 +109,35 @@ int sys_block_find_parent(const char* part_name, char* out, size_t size)
 void dev_get_sectors(const char* disk_name, const char* dev_name, uint64_t* sectors)
 {
     char path[PATH_SIZE];
-    path_sys_size(path, sizeof(path), dev_name);
-    FILE* file = fopen(path, "re");
+    path_sys_size(path, dev_name);
+    stream_guard file(fopen(path, "re"));
     if (file == nullptr) {
-        path_sys_part_size(path, sizeof(path), disk_name, dev_name);
-        file = fopen(path, "re");
+        path_sys_part_size(path, disk_name, dev_name);
+        file.reset(fopen(path, "re"));
     }
-    char text[NUMBER_SIZE];
-    if (!read_line_and_close(file, text)) {
+    sysfs_number number;
+    if (!read_number(file, &number)) {
         log_info("get size err, file = %s\n", path);
         return;
     }
-    *sectors = to_number(text);
-    log_info("dev = %s, get sector number = %s(%llu)\n", dev_name, text,
-             static_cast<unsigned long long>(*sectors));
+    *sectors = number.value;
+    log_info("dev = %s, get sector number = %s(%llu)\n", dev_name, number.text,
+             static_cast<unsigned long long>(number.value));
 }
 
 void dev_get_sector_size(const char* disk_name, uint64_t* bytes)
 {
     char path[PATH_SIZE];
-    path_sys_sector_size(path, sizeof(path), disk_name);
-    FILE* file = fopen(path, "re");
-    char text[NUMBER_SIZE];
-    if (!read_line_and_close(file, text)) {
+    path_sys_sector_size(path, disk_name);
+    const stream_guard file(fopen(path, "re"));
+    sysfs_number number;
+    if (!read_number(file, &number)) {
         log_info("get sector_size err, file = %s\n", path);
         return;
     }
-    *bytes = to_number(text);
-    log_info("dev = %s, get sector size = %s(%llu)\n", disk_name, text,
-             static_cast<unsigned long long>(*bytes));
+    *bytes = number.value;
+    log_info("dev = %s, get sector size = %s(%llu)\n", disk_name, number.text,
+             static_cast<unsigned long long>(number.value));
 }
 
 int path_get_space(const char* path, uint64_t* total, uint64_t* free_bytes)
@@ -195,6 +194,6 @@ int script_get_label(const char* dev_name, char* out, size_t size)
     if (!scratch_read(LABEL_QUERY, text, "%s %s > %s", {LABEL_SCRIPT, dev_name, SCRATCH_LABEL})) {
         return 1;
     }
-    copy_bytes(out, size, text, strcspn(text, "\t\n\r"));
+    copy_value(out, size, text, strcspn(text, "\t\n\r"));
     return 0;
 }

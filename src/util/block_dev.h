@@ -27,7 +27,7 @@ int path_get_space(const char* path, uint64_t* total, uint64_t* free_bytes);
 
 // The value behind the first occurrence of key (with its "=") in blkid's output, up to a quote or
 // a space. Zero-fills out and copies at most size characters: a value that long leaves no
-// terminating zero, so callers keep one zero byte behind.
+// terminating zero.
 void blkid_get_value(const char* dev_name, const char* key, char* out, size_t size);
 
 // The label as stored on the volume, without blkid's encoding; otherwise like blkid_get_value.
@@ -36,3 +36,25 @@ void blkid_get_label(const char* dev_name, char* out, size_t size);
 // The label script's first output line, spaces kept, at most size characters, zero-filled.
 // 0 when the script ran and its output was read, else 1.
 int script_get_label(const char* dev_name, char* out, size_t size);
+
+// The same three into a whole array, which always ends with a zero.
+template <size_t N>
+void blkid_get_value(const char* dev_name, const char* key, char (&out)[N])
+{
+    out[N - 1] = '\0';
+    blkid_get_value(dev_name, key, out, N - 1);
+}
+
+template <size_t N>
+void blkid_get_label(const char* dev_name, char (&out)[N])
+{
+    out[N - 1] = '\0';
+    blkid_get_label(dev_name, out, N - 1);
+}
+
+template <size_t N>
+[[nodiscard]] int script_get_label(const char* dev_name, char (&out)[N])
+{
+    out[N - 1] = '\0';
+    return script_get_label(dev_name, out, N - 1);
+}

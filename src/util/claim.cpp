@@ -31,7 +31,7 @@ int move_aside(const char* path)
         return 1;
     }
     char target[PATH_SIZE];
-    text_format(target, sizeof(target), "%s/entry", place);
+    text_format(target, "%s/entry", place);
     if (rename(path, target) != 0) {
         // Its owner may have been faster; the name is free then.
         const bool is_free = errno == ENOENT;

@@ -77,7 +77,7 @@ struct bounded_text {
 bool command_format(std::span<char> out, const char* format,
                     std::initializer_list<const char*> words)
 {
-    memset(out.data(), 0, out.size());
+    text_clear(out);
     bounded_text command{out};
     const auto* word = words.begin();
     char quote = '\0';
@@ -88,7 +88,7 @@ bool command_format(std::span<char> out, const char* format,
             continue;
         }
         if (word == words.end() || !is_taken(*word, quote)) {
-            memset(out.data(), 0, out.size());
+            text_clear(out);
             return false;
         }
         command.append(*word, strlen(*word));

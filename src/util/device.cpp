@@ -23,7 +23,7 @@ int device_get_model(char* out, int size)
         log_err("err!\n");
         return 1;
     }
-    text_format(out, static_cast<size_t>(size), "%s", model);
+    text_format({out, static_cast<size_t>(size)}, "%s", model);
     log_info("get model = %s\n", out);
     return 0;
 }

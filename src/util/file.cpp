@@ -220,6 +220,12 @@ int file_read_buf(const char* path, void* buffer, int32_t size)
     return 0;
 }
 
+int file_read_text(const char* path, std::span<char> out)
+{
+    text_clear(out);
+    return file_read_buf(path, out.data(), static_cast<int32_t>(out.size() - 1));
+}
+
 int file_delete(const char* path)
 {
     if (path == nullptr) {

@@ -5,6 +5,7 @@
 
 #include <cstdint>
 #include <cstdio>
+#include <span>
 
 #include "util/guard.h"
 
@@ -53,8 +54,11 @@ int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length)
 char* file_read_all(const char* path);
 
 // Zero-fills buffer and reads up to size bytes. A file of at least size bytes leaves no terminating
-// zero: callers that want text keep one zero byte behind the size they pass.
+// zero.
 int file_read_buf(const char* path, void* buffer, int32_t size);
+
+// The first characters of a file, cut to out and zero-filled; an empty text on failure.
+int file_read_text(const char* path, std::span<char> out);
 
 int file_delete(const char* path);
 

@@ -93,7 +93,7 @@ int umount_dir_entries(const char* path)
             continue;
         }
         char target[LONG_COMMAND_SIZE];
-        text_format(target, sizeof(target), "%s/%s", path, name);
+        text_format(target, "%s/%s", path, name);
         fs_umount(target);
     }
     return 0;

@@ -11,39 +11,39 @@ constexpr size_t MOUNT_BASE_LENGTH = sizeof(MOUNT_BASE) - 1;
 
 }  // namespace
 
-void path_dev_node(char* out, size_t size, const char* dev_name)
+void path_dev_node(std::span<char> out, const char* dev_name)
 {
-    text_format(out, size, "/dev/%s", dev_name);
+    text_format(out, "/dev/%s", dev_name);
 }
 
-void path_sys_disk(char* out, size_t size, const char* disk_name)
+void path_sys_disk(std::span<char> out, const char* disk_name)
 {
-    text_format(out, size, "%s/%s", SYS_BLOCK, disk_name);
+    text_format(out, "%s/%s", SYS_BLOCK, disk_name);
 }
 
-void path_sys_size(char* out, size_t size, const char* dev_name)
+void path_sys_size(std::span<char> out, const char* dev_name)
 {
-    text_format(out, size, "/sys/class/block/%s/size", dev_name);
+    text_format(out, "/sys/class/block/%s/size", dev_name);
 }
 
-void path_sys_part_size(char* out, size_t size, const char* disk_name, const char* dev_name)
+void path_sys_part_size(std::span<char> out, const char* disk_name, const char* dev_name)
 {
-    text_format(out, size, "/sys/block/%s/%s/size", disk_name, dev_name);
+    text_format(out, "/sys/block/%s/%s/size", disk_name, dev_name);
 }
 
-void path_sys_sector_size(char* out, size_t size, const char* disk_name)
+void path_sys_sector_size(std::span<char> out, const char* disk_name)
 {
-    text_format(out, size, "/sys/block/%s/queue/hw_sector_size", disk_name);
+    text_format(out, "/sys/block/%s/queue/hw_sector_size", disk_name);
 }
 
-void path_mount_name(char* out, size_t size, int32_t disk_number, int32_t part_number)
+void path_mount_name(std::span<char> out, int32_t disk_number, int32_t part_number)
 {
-    text_format(out, size, "disk%d_part%d", disk_number, part_number);
+    text_format(out, "disk%d_part%d", disk_number, part_number);
 }
 
-void path_mount_dir(char* out, size_t size, const char* mount_name)
+void path_mount_dir(std::span<char> out, const char* mount_name)
 {
-    text_format(out, size, "%s/%s", MOUNT_BASE, mount_name);
+    text_format(out, "%s/%s", MOUNT_BASE, mount_name);
 }
 
 int mount_path_to_name(const char* mount_path, char* out, size_t size)
@@ -57,7 +57,7 @@ int mount_path_to_name(const char* mount_path, char* out, size_t size)
         return 1;
     }
     const char* name = mount_path + MOUNT_BASE_LENGTH;
-    text_copy(out, size, *name == '/' ? name + 1 : name);
+    text_copy({out, size}, *name == '/' ? name + 1 : name);
     return 0;
 }
 

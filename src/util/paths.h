@@ -3,6 +3,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <span>
 
 constexpr size_t PATH_SIZE = 128;       // buffers for paths below the fixed directories
 constexpr size_t DEV_PATH_SIZE = 64;    // buffers for "/dev/%s" of a record's device name
@@ -69,23 +70,23 @@ inline constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
                                           "0123456789._-!";
 
 // "/dev/%s" of a device name.
-void path_dev_node(char* out, size_t size, const char* dev_name);
+void path_dev_node(std::span<char> out, const char* dev_name);
 
 // The directory of a disk under /sys/block.
-void path_sys_disk(char* out, size_t size, const char* disk_name);
+void path_sys_disk(std::span<char> out, const char* disk_name);
 
 // The size file of any block device by its own name, and of a partition below its disk.
-void path_sys_size(char* out, size_t size, const char* dev_name);
-void path_sys_part_size(char* out, size_t size, const char* disk_name, const char* dev_name);
+void path_sys_size(std::span<char> out, const char* dev_name);
+void path_sys_part_size(std::span<char> out, const char* disk_name, const char* dev_name);
 
 // The file with a disk's hardware sector size.
-void path_sys_sector_size(char* out, size_t size, const char* disk_name);
+void path_sys_sector_size(std::span<char> out, const char* disk_name);
 
 // "disk%d_part%d": the directory name of a partition below the mount base.
-void path_mount_name(char* out, size_t size, int32_t disk_number, int32_t part_number);
+void path_mount_name(std::span<char> out, int32_t disk_number, int32_t part_number);
 
 // The mount base joined with such a name.
-void path_mount_dir(char* out, size_t size, const char* mount_name);
+void path_mount_dir(std::span<char> out, const char* mount_name);
 
 // The directory name out of a mount path: drops as many characters as the mount base has, without
 // comparing them, and one slash behind. 0, or 1 for a null argument or a path shorter than that.
@@ -93,7 +94,7 @@ int mount_path_to_name(const char* mount_path, char* out, size_t size);
 
 // True when path is a directory directly below the mount base whose name fits MOUNT_NAME_SIZE and
 // is plain: what the daemon itself once chose, and not what a damaged database says.
-bool mount_path_is_usable(const char* path);
+[[nodiscard]] bool mount_path_is_usable(const char* path);
 
 // True when name holds nothing but NAME_CHARACTERS.
-bool name_is_plain(const char* name);
+[[nodiscard]] bool name_is_plain(const char* name);

@@ -1,11 +1,10 @@
 #include "util/scratch.h"
 
-#include <cstring>
-
 #include "log/log.h"
 #include "util/command.h"
 #include "util/exec.h"
 #include "util/file.h"
+#include "util/text.h"
 
 namespace {
 
@@ -67,12 +66,11 @@ scratch_lines::~scratch_lines()
 bool scratch_read(const scratch_query& query, std::span<char> out, const char* format,
                   scratch_words words, const char* file, int line)
 {
-    memset(out.data(), 0, out.size());
+    text_clear(out);
     if (!has_run(query, format, words, file, line)) {
         return false;
     }
-    const bool was_read =
-        file_read_buf(query.path, out.data(), static_cast<int32_t>(out.size() - 1)) == 0;
+    const bool was_read = file_read_text(query.path, out) == 0;
     end_query(query, was_read);
     return was_read;
 }

@@ -5,28 +5,34 @@
 #include <cstdlib>
 #include <cstring>
 
-void text_copy(char* out, size_t size, const char* text)
+void text_copy(std::span<char> out, const char* text)
 {
-    text_copy_n(out, size, text, strlen(text));
+    text_copy_n(out, text, strlen(text));
 }
 
-void text_copy_n(char* out, size_t size, const char* text, size_t count)
+void text_copy_n(std::span<char> out, const char* text, size_t count)
 {
-    if (size == 0) {
+    if (out.empty()) {
         return;
     }
-    const size_t length = strnlen(text, count < size - 1 ? count : size - 1);
-    memmove(out, text, length);
-    memset(out + length, 0, size - length);
+    const size_t room = out.size() - 1;
+    const size_t length = strnlen(text, count < room ? count : room);
+    memmove(out.data(), text, length);
+    memset(out.data() + length, 0, out.size() - length);
 }
 
-void text_format(char* out, size_t size, const char* fmt, ...)
+void text_format(std::span<char> out, const char* fmt, ...)
 {
-    memset(out, 0, size);
+    text_clear(out);
     va_list args;
     va_start(args, fmt);
-    vsnprintf(out, size, fmt, args);
+    vsnprintf(out.data(), out.size(), fmt, args);
     va_end(args);
+}
+
+void text_clear(std::span<char> out)
+{
+    memset(out.data(), 0, out.size());
 }
 
 char* text_join(const char* a, const char* b, const char* c)
@@ -34,7 +40,7 @@ char* text_join(const char* a, const char* b, const char* c)
     const size_t size = strlen(a) + strlen(b) + strlen(c) + 1;
     auto* joined = static_cast<char*>(malloc(size));
     if (joined != nullptr) {
-        text_format(joined, size, "%s%s%s", a, b, c);
+        text_format({joined, size}, "%s%s%s", a, b, c);
     }
     return joined;
 }

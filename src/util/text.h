@@ -2,21 +2,25 @@
 #pragma once
 
 #include <cstddef>
+#include <span>
 
-// Copies text into out and zero-fills the rest; cut at size - 1 characters, always terminated.
-void text_copy(char* out, size_t size, const char* text);
+// Copies text into out and zero-fills the rest; cut at one character less than out, always
+// terminated. An out of no bytes is left alone.
+void text_copy(std::span<char> out, const char* text);
 
 // Copies at most count characters of text the same way.
-void text_copy_n(char* out, size_t size, const char* text, size_t count);
+void text_copy_n(std::span<char> out, const char* text, size_t count);
 
 // snprintf into a zero-filled buffer; cutting is wanted, not an error.
-void text_format(char* out, size_t size, const char* fmt, ...)
-    __attribute__((format(printf, 3, 4)));
+void text_format(std::span<char> out, const char* fmt, ...) __attribute__((format(printf, 2, 3)));
+
+// Zero-fills.
+void text_clear(std::span<char> out);
 
 // The three texts in one, to be released with free(); null when there is no memory.
-char* text_join(const char* a, const char* b, const char* c);
+[[nodiscard]] char* text_join(const char* a, const char* b, const char* c);
 
-bool text_has_prefix(const char* text, const char* prefix);
+[[nodiscard]] bool text_has_prefix(const char* text, const char* prefix);
 
 // 0 when both have the same length and the same bytes, else 1.
 int str_equal(const char* a, const char* b);
@@ -26,15 +30,3 @@ int str_equal_nullsafe(const char* a, const char* b);
 
 // 1 when text holds at least count "-" characters, else 0; 1 for a null text.
 int str_count_char_at_least(const char* text, int count);
-
-template <size_t N>
-void text_copy(char (&out)[N], const char* text)
-{
-    text_copy(out, N, text);
-}
-
-template <size_t N>
-void text_clear(char (&out)[N])
-{
-    text_copy(out, N, "");
-}

@@ -111,7 +111,7 @@ void require_event(const expected_event& expected)
 void carry_out()
 {
     char name[EVENT_NAME_SIZE + 1];
-    text_copy_n(name, sizeof(name), pipes.event.dev_name, EVENT_NAME_SIZE);
+    text_copy_n(name, pipes.event.dev_name, EVENT_NAME_SIZE);
     switch (pipes.event.type) {
         case EVENT_DISK_ADD:
             disk_sets_add_dev(&disks, name);

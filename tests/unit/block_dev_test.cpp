@@ -426,6 +426,22 @@ TEST_F(Blkid, CopiesAtMostTheBuffersSizeWithoutATerminatingZero)
     }
 }
 
+TEST_F(Blkid, AWholeArrayAlwaysEndsWithAZero)
+{
+    for (const char* text : {"123456", "1234567", "12345678"}) {
+        answer(std::string("/dev/sda1: LABEL=\"") + text + "\"\n");
+        char value[8] = {'#', '#', '#', '#', '#', '#', '#', '#'};
+        char raw[8] = {'#', '#', '#', '#', '#', '#', '#', '#'};
+        log_of([&] {
+            blkid_get_value("sda1", "LABEL=", value);
+            blkid_get_label("sda1", raw);
+        });
+        EXPECT_EQ(std::string(value, 8).c_str(), std::string(text).substr(0, 7)) << text;
+        EXPECT_EQ(value[7], '\0') << text;
+        EXPECT_EQ(std::string(raw, 8), std::string(value, 8)) << text;
+    }
+}
+
 TEST_F(Blkid, TheBufferIsZeroFilledAlsoWhenNothingIsFound)
 {
     answer("");
@@ -583,6 +599,14 @@ TEST_F(LabelScript, ANullArgumentIsLogged)
         EXPECT_EQ(script_get_label("sda1", nullptr, 128), 1);
     });
     EXPECT_EQ(log, "ERROR[block_dev.cpp:N]err!\nERROR[block_dev.cpp:N]err!\n");
+}
+
+TEST_F(LabelScript, AWholeArrayAlwaysEndsWithAZero)
+{
+    answer("12345678\n");
+    char out[8] = {'#', '#', '#', '#', '#', '#', '#', '#'};
+    log_of([&] { EXPECT_EQ(script_get_label("sda1", out), 0); });
+    EXPECT_EQ(std::string(out, 8), std::string("1234567\0", 8));
 }
 
 TEST_F(LabelScript, ALongLabelStaysInsideItsBuffer)

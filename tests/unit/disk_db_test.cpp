@@ -20,7 +20,7 @@ disk_db_record make_record(const char* uid, const char* dev_name, const char* di
     text_copy(record.dev_name, dev_name);
     text_copy(record.disk_name, disk_name);
     if (disk_name[0] != '\0') {
-        path_mount_dir(record.mount_path, sizeof(record.mount_path), disk_name);
+        path_mount_dir(record.mount_path, disk_name);
     }
     record.mountd = mountd;
     return record;

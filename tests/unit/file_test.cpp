@@ -394,6 +394,23 @@ TEST_F(FileReadBuf, AMissingFileLeavesTheBufferAlone)
     EXPECT_STREQ(buffer, "old");
 }
 
+TEST_F(FileReadBuf, AsATextKeepsRoomForItsZero)
+{
+    for (int length : {6, 7, 8}) {
+        const std::string content = std::string("12345678").substr(0, length);
+        write_file(file, content);
+        char text[10];
+        memset(text, '#', sizeof(text));
+        EXPECT_EQ(file_read_text(file.c_str(), {text, 8}), 0);
+        EXPECT_EQ(text, content.substr(0, 7));
+        EXPECT_EQ(text[7], '\0');
+        EXPECT_EQ(text[8], '#') << length;
+    }
+    char text[4] = "old";
+    log_of([&] { EXPECT_EQ(file_read_text(missing.c_str(), text), 1); });
+    EXPECT_STREQ(text, "");
+}
+
 TEST_F(FileReadBuf, AFileThatCannotBeOpenedIsLogged)
 {
     make_socket(file);

@@ -52,7 +52,7 @@ protected:
         text_copy(record.uid, uid);
         text_copy(record.dev_name, dev_name);
         text_copy(record.disk_name, disk_name);
-        path_mount_dir(record.mount_path, sizeof(record.mount_path), disk_name);
+        path_mount_dir(record.mount_path, disk_name);
         disk_db_add(&record);
     }
 

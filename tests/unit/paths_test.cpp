@@ -11,13 +11,13 @@ using support::log_of;
 
 namespace {
 
-using dev_path_maker = void (*)(char*, size_t, const char*);
+using dev_path_maker = void (*)(std::span<char>, const char*);
 
 std::string made(dev_path_maker maker, const char* name, size_t size = PATH_SIZE)
 {
     char out[256];
     memset(out, '#', sizeof(out));
-    maker(out, size, name);
+    maker({out, size}, name);
     EXPECT_EQ(out[size], '#') << name;
     return out;
 }
@@ -74,7 +74,7 @@ TEST(Paths, AreMadeFromDeviceNames)
 TEST(Paths, TheSizeOfAPartitionStandsBelowItsDisk)
 {
     char out[PATH_SIZE];
-    path_sys_part_size(out, sizeof(out), "sda", "sda1");
+    path_sys_part_size(out, "sda", "sda1");
     EXPECT_STREQ(out, "/sys/block/sda/sda1/size");
 }
 
@@ -99,7 +99,7 @@ TEST(Paths, TheMountNameHoldsBothNumbers)
                  {-1, 2, "disk-1_part2"}};
     for (const auto& c : cases) {
         char out[32];
-        path_mount_name(out, sizeof(out), c.disk, c.part);
+        path_mount_name(out, c.disk, c.part);
         EXPECT_STREQ(out, c.expected);
     }
 }

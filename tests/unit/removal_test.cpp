@@ -24,8 +24,8 @@ protected:
             const std::string dev = disk + std::to_string(slot + 1);
             part_info* part = put_part(&sets.entries[place].disk, slot, dev.c_str(), 4000);
             text_copy(part->uid, ("U-" + dev).c_str());
-            path_mount_name(part->disk_name, sizeof(part->disk_name), place + 1, slot + 1);
-            path_mount_dir(part->mount_path, sizeof(part->mount_path), part->disk_name);
+            path_mount_name(part->disk_name, place + 1, slot + 1);
+            path_mount_dir(part->mount_path, part->disk_name);
             part->mount_status = 1;
             add_mount("/dev/" + dev, part->mount_path);
             disk_db_record record{};

@@ -40,7 +40,7 @@ TEST(TextCopy, CutsAtOneLessThanTheSize)
     };
     for (const auto& c : cases) {
         dirty_buffer out;
-        text_copy(out.bytes, 8, c.text);
+        text_copy({out.bytes, 8}, c.text);
         EXPECT_STREQ(out.bytes, c.expected);
         EXPECT_TRUE(out.untouched_from(8)) << c.text;
     }
@@ -49,7 +49,7 @@ TEST(TextCopy, CutsAtOneLessThanTheSize)
 TEST(TextCopy, ZeroFillsTheRest)
 {
     dirty_buffer out;
-    text_copy(out.bytes, 16, "abc");
+    text_copy({out.bytes, 16}, "abc");
     EXPECT_TRUE(out.zero_between(3, 16));
     EXPECT_TRUE(out.untouched_from(16));
 }
@@ -57,7 +57,7 @@ TEST(TextCopy, ZeroFillsTheRest)
 TEST(TextCopy, ABufferOfOneByteHoldsTheEmptyText)
 {
     dirty_buffer out;
-    text_copy(out.bytes, 1, "abc");
+    text_copy({out.bytes, 1}, "abc");
     EXPECT_EQ(out.bytes[0], '\0');
     EXPECT_TRUE(out.untouched_from(1));
 }
@@ -65,7 +65,7 @@ TEST(TextCopy, ABufferOfOneByteHoldsTheEmptyText)
 TEST(TextCopy, ABufferOfNoBytesIsLeftAlone)
 {
     dirty_buffer out;
-    text_copy(out.bytes, 0, "abc");
+    text_copy({out.bytes, 0}, "abc");
     EXPECT_TRUE(out.untouched_from(0));
 }
 
@@ -81,14 +81,14 @@ TEST(TextCopy, TakesTheSizeOfAnArrayByItself)
 TEST(TextCopyN, TakesAtMostThatManyCharacters)
 {
     dirty_buffer out;
-    text_copy_n(out.bytes, 8, "abcdef", 3);
+    text_copy_n({out.bytes, 8}, "abcdef", 3);
     EXPECT_STREQ(out.bytes, "abc");
     EXPECT_TRUE(out.zero_between(3, 8));
-    text_copy_n(out.bytes, 8, "abcdef", 0);
+    text_copy_n({out.bytes, 8}, "abcdef", 0);
     EXPECT_STREQ(out.bytes, "");
-    text_copy_n(out.bytes, 8, "ab", 5);
+    text_copy_n({out.bytes, 8}, "ab", 5);
     EXPECT_STREQ(out.bytes, "ab");
-    text_copy_n(out.bytes, 4, "abcdef", 6);
+    text_copy_n({out.bytes, 4}, "abcdef", 6);
     EXPECT_STREQ(out.bytes, "abc");
     EXPECT_TRUE(out.untouched_from(8));
 }
@@ -96,10 +96,10 @@ TEST(TextCopyN, TakesAtMostThatManyCharacters)
 TEST(TextFormat, CutsAndZeroFills)
 {
     dirty_buffer out;
-    text_format(out.bytes, 8, "%s-%d", "ab", 7);
+    text_format({out.bytes, 8}, "%s-%d", "ab", 7);
     EXPECT_STREQ(out.bytes, "ab-7");
     EXPECT_TRUE(out.zero_between(4, 8));
-    text_format(out.bytes, 8, "%s", "123456789");
+    text_format({out.bytes, 8}, "%s", "123456789");
     EXPECT_STREQ(out.bytes, "1234567");
     EXPECT_TRUE(out.untouched_from(8));
 }
