@@ -59,7 +59,7 @@ int parse_mount_line(mount_table* table, const char* line)
     if (path == nullptr) {
         return 1;
     }
-    if (!text_has_prefix(line, "/dev/sd") && !text_has_prefix(line, "/dev/mmcblk0")) {
+    if (!text_has_prefix(line, SD_NODE_PREFIX) && !text_has_prefix(line, CARD_NODE_PREFIX)) {
         return 1;
     }
     if (table->num >= MOUNT_TABLE_SIZE) {

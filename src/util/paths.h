@@ -25,6 +25,10 @@ inline constexpr char HOTPLUG_MOUNT_HOOK[] = "/etc/hotplug.d/block/10-mount";
 // The kernel's.
 inline constexpr char SYS_BLOCK[] = "/sys/block";
 
+// Other mounts are not looked at: "Names beginning with" in docs/limits.md.
+inline constexpr char SD_NODE_PREFIX[] = "/dev/sd";
+inline constexpr char CARD_NODE_PREFIX[] = "/dev/mmcblk0";
+
 // What the router itself runs from is mounted at these, where it has them.
 inline constexpr const char* SYSTEM_DIRS[] = {"/", "/rom", "/overlay", "/boot"};
 
