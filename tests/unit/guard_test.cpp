@@ -91,13 +91,13 @@ TEST(Guard, ClosingAStreamTellsThatTheDiskIsFull)
 {
     stream_guard full(fopen("/dev/full", "we"));
     ASSERT_NE(full, nullptr);
-    EXPECT_GT(fputs("text", full), 0);
+    EXPECT_GE(fputs("text", full), 0);
     EXPECT_FALSE(stream_close(full));
     EXPECT_EQ(full, nullptr);
 
     stream_guard null(fopen("/dev/null", "we"));
     ASSERT_NE(null, nullptr);
-    EXPECT_GT(fputs("text", null), 0);
+    EXPECT_GE(fputs("text", null), 0);
     EXPECT_TRUE(stream_close(null));
 }
 

@@ -172,18 +172,6 @@ TEST_F(Manager, a_start_with_disks_mounts_and_publishes_them)
     EXPECT_FALSE(contains(log, "check disk is alread mountd"));
 }
 
-TEST_F(Manager, the_scan_of_block_input_mode_takes_over_what_is_mounted)
-{
-    plug_with_part("sda", 400000);
-    add_mount("/dev/sda1", "/tmp/mountd/disk3_part3");
-    manager_scan(manager, 1);
-    const part_info* part = disk_sets_find_part(&manager->disks, "sda1");
-    ASSERT_NE(part, nullptr);
-    EXPECT_EQ(part->mount_status, 1);
-    EXPECT_STREQ(part->mount_path, "/tmp/mountd/disk3_part3");
-    EXPECT_TRUE(actions().empty());
-}
-
 TEST_F(Manager, a_scan_that_cannot_read_the_kernels_list_answers_1)
 {
     const std::string log = expect_in_child([&] {

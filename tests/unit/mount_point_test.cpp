@@ -42,41 +42,44 @@ void mount_numbers(int first, int last)
 
 }  // namespace
 
-TEST_F(MountPoint, with_disks_1_and_3_present_a_new_disk_gets_2)
+TEST_F(MountPoint, a_new_disk_gets_the_first_number_that_no_disk_has)
 {
-    put_numbers({1, 3, 0});
-    EXPECT_EQ(get_mount_point_num(&sets), 2);
-    put_numbers({1, 0, 3});
-    EXPECT_EQ(get_mount_point_num(&sets), 2);
+    const struct {
+        std::vector<int> present;
+        int expected;
+    } cases[] = {
+        {{0}, 1},
+        {{1, 3, 0}, 2},
+        {{1, 0, 3}, 2},
+        {{1, 2, 0}, 3},
+        {{1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 0}, 16},
+    };
+    for (const auto& c : cases) {
+        put_numbers(c.present);
+        const std::string log =
+            capture_stdout([&] { EXPECT_EQ(get_mount_point_num(&sets), c.expected); });
+        const std::string number = std::to_string(c.expected);
+        EXPECT_TRUE(contains(log, "point num = " + number + "\n")) << log;
+    }
 }
 
-TEST_F(MountPoint, with_disks_1_and_2_present_a_new_disk_gets_3)
+TEST_F(MountPoint, a_number_under_which_something_is_mounted_is_not_given)
 {
-    put_numbers({1, 2, 0});
-    const std::string log = capture_stdout([&] { EXPECT_EQ(get_mount_point_num(&sets), 3); });
-    EXPECT_TRUE(contains(log, "max = 2, point num = 3\n")) << log;
-}
-
-TEST_F(MountPoint, with_nothing_present_and_disk1_part1_still_mounted_a_new_disk_gets_2)
-{
-    put_numbers({0});
-    EXPECT_EQ(get_mount_point_num(&sets), 1);
-    add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
-    EXPECT_EQ(get_mount_point_num(&sets), 2);
-}
-
-TEST_F(MountPoint, a_gap_is_not_filled_while_something_is_mounted_under_its_number)
-{
-    put_numbers({1, 3, 0});
-    add_mount("/dev/sdq1", "/tmp/mountd/disk2_part4");
-    EXPECT_EQ(get_mount_point_num(&sets), 3);
-}
-
-TEST_F(MountPoint, a_mount_without_numbers_blocks_no_number)
-{
-    put_numbers({0});
-    add_mount("/dev/sda1", "/tmp/mountd/usbdisk");
-    EXPECT_EQ(get_mount_point_num(&sets), 1);
+    const struct {
+        std::vector<int> present;
+        const char* mounted;
+        int expected;
+    } cases[] = {
+        {{0}, "/tmp/mountd/disk1_part1", 2},
+        {{1, 3, 0}, "/tmp/mountd/disk2_part4", 3},
+        {{0}, "/tmp/mountd/usbdisk", 1},
+    };
+    for (const auto& c : cases) {
+        put_numbers(c.present);
+        support::remove_all(support_disk::MOUNTS_FILE);
+        add_mount("/dev/sdq1", c.mounted);
+        EXPECT_EQ(get_mount_point_num(&sets), c.expected) << c.mounted;
+    }
 }
 
 TEST_F(MountPoint, when_all_16_candidates_are_mounted_the_17th_is_taken_untested)
@@ -89,12 +92,6 @@ TEST_F(MountPoint, when_all_16_candidates_are_mounted_the_17th_is_taken_untested
     put_numbers({1, 2, 0});
     mount_numbers(3, 18);
     EXPECT_EQ(get_mount_point_num(&sets), 19);
-}
-
-TEST_F(MountPoint, fifteen_disks_in_order_give_16)
-{
-    put_numbers({1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12, 13, 14, 15, 0});
-    EXPECT_EQ(get_mount_point_num(&sets), 16);
 }
 
 TEST_F(MountPoint, free_entries_between_disks_do_not_end_the_walk)
