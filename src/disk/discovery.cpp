@@ -78,7 +78,7 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
         return 1;
     }
     log_info("add dev name = %s\n", dev_name);
-    if (dev_check_blkid(dev_name) != 0) {
+    if (dev_check_blkid(dev_name) != MATCHES) {
         return 0;
     }
     if (disk_sets_find_part(sets, dev_name) != nullptr) {
@@ -86,9 +86,9 @@ int disk_sets_add_dev(disk_sets* sets, const char* dev_name)
         log_warn("=== ===> dev is already add! dev name = %s\n", dev_name);
         return 0;
     }
-    if (sys_block_has_dev(dev_name) != 0) {
+    if (sys_block_has_dev(dev_name) != MATCHES) {
         disk_sets_add_part(sets, dev_name);
-    } else if (dev_name_is_disk(dev_name) == 0 && !is_kept_out(dev_name)) {
+    } else if (dev_name_is_disk(dev_name) == MATCHES && !is_kept_out(dev_name)) {
         disk_sets_add_disk(sets, dev_name);
     }
     return 0;
@@ -124,7 +124,7 @@ int disk_sets_add_disk(disk_sets* sets, const char* root_dev)
 void disk_sets_add_part(disk_sets* sets, const char* dev_name)
 {
     char root_dev[ROOT_DEV_SIZE]{};
-    if (sys_block_find_parent(dev_name, root_dev, sizeof(root_dev)) != 0) {
+    if (sys_block_find_parent(dev_name, root_dev, sizeof(root_dev)) != MATCHES) {
         log_err("not find dev name = %s\n", dev_name);
         return;
     }
@@ -133,7 +133,7 @@ void disk_sets_add_part(disk_sets* sets, const char* dev_name)
     }
     disk_obj* disk = find_or_add_owner(sets, root_dev);
     // Adding the owner has scanned all its partitions, this one included as a rule.
-    if (disk == nullptr || disk_obj_has_dev(disk, dev_name) == 0) {
+    if (disk == nullptr || disk_obj_has_dev(disk, dev_name) == MATCHES) {
         return;
     }
     if (disk_obj_add_sub_part(disk, dev_name) == 0) {
@@ -180,7 +180,7 @@ void disk_obj_scan_parts(disk_obj* disk)
         return;
     }
     while (const char* name = dir.next_name()) {
-        if (dev_name_is_disk(name) == 0) {
+        if (dev_name_is_disk(name) == MATCHES) {
             disk_obj_add_sub_part(disk, name);
         }
     }

@@ -97,11 +97,11 @@ part_info* disk_obj_get_part(disk_obj* disk, const char* dev_name)
         return nullptr;
     }
     log_info("get part, dev name = %s\n", dev_name);
-    if (str_equal_nullsafe(disk->root.dev_name, dev_name) == 0) {
+    if (str_equal_nullsafe(disk->root.dev_name, dev_name) == MATCHES) {
         return &disk->root;
     }
     for (part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.dev_name, dev_name) == 0) {
+        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.dev_name, dev_name) == MATCHES) {
             return &slot.part;
         }
     }
@@ -114,7 +114,7 @@ part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* dir_name)
         return nullptr;
     }
     for (part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.disk_name, dir_name) == 0) {
+        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.disk_name, dir_name) == MATCHES) {
             return &slot.part;
         }
     }
@@ -129,12 +129,12 @@ int disk_obj_has_dev(const disk_obj* disk, const char* dev_name)
     }
     log_info("check dev, name = %s\n", dev_name);
     log_info("root part dev = %s\n", disk->root.dev_name);
-    if (str_equal_nullsafe(disk->root.dev_name, dev_name) == 0) {
+    if (str_equal_nullsafe(disk->root.dev_name, dev_name) == MATCHES) {
         log_warn("root dev already exist, name = %s\n", dev_name);
         return 0;
     }
     for (const part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.dev_name, dev_name) == 0) {
+        if (slot.in_use == 1 && str_equal_nullsafe(slot.part.dev_name, dev_name) == MATCHES) {
             log_warn("dev already exist, name = %s\n", dev_name);
             return 0;
         }
@@ -152,7 +152,7 @@ int disk_obj_clear_part(disk_obj* disk, const part_info* part)
             continue;
         }
         log_info("want clear dev = %s, %s\n", slot.part.dev_name, part->dev_name);
-        if (str_equal_nullsafe(slot.part.dev_name, part->dev_name) == 0) {
+        if (str_equal_nullsafe(slot.part.dev_name, part->dev_name) == MATCHES) {
             log_info("clear ok, find dev = %s\n", part->dev_name);
             clear_slot(&slot);
             return 0;

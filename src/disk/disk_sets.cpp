@@ -60,7 +60,8 @@ disk_entry* disk_sets_find_disk(disk_sets* sets, const char* root_dev)
         return nullptr;
     }
     for (disk_entry& entry : sets->entries) {
-        if (entry.in_use == 1 && str_equal_nullsafe(entry.disk.root.dev_name, root_dev) == 0) {
+        if (entry.in_use == 1 &&
+            str_equal_nullsafe(entry.disk.root.dev_name, root_dev) == MATCHES) {
             log_info("get disk, root name = %s\n", root_dev);
             disk_obj_dump(&entry.disk);
             return &entry;

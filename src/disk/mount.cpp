@@ -49,7 +49,7 @@ bool wait_until_mounted(const char* dev_path)
 {
     for (int i = 0; i < MOUNT_WAIT_TRIES; ++i) {
         pause_seconds(MOUNT_WAIT_SECONDS);
-        if (is_dev_mounted(dev_path) == 1) {
+        if (is_dev_mounted(dev_path) == YES) {
             return true;
         }
     }
@@ -86,11 +86,11 @@ void overwrite_row(disk_db_record* record, const part_info* part)
 
 void take_remembered_path(part_info* part, disk_db_record* record)
 {
-    if (str_equal_nullsafe(part->mount_path, record->mount_path) != 0) {
+    if (str_equal_nullsafe(part->mount_path, record->mount_path) != MATCHES) {
         log_info("===> update mount path %s --> %s\n", part->mount_path, record->mount_path);
         text_copy(part->mount_path, record->mount_path);
     }
-    if (str_equal_nullsafe(part->disk_name, record->disk_name) != 0) {
+    if (str_equal_nullsafe(part->disk_name, record->disk_name) != MATCHES) {
         log_info("===> update disk name %s --> %s\n", part->disk_name, record->disk_name);
         text_copy(part->disk_name, record->disk_name);
     }
@@ -178,7 +178,7 @@ void mount_part(part_info* part)
     // Without a name it is not published: what somebody else has mounted is not ours to offer. See
     // "A device that is mounted already" in docs/limits.md.
     text_clear(part->disk_name);
-    if (is_dev_mounted(dev_path) == 1) {
+    if (is_dev_mounted(dev_path) == YES) {
         log_warn("already mounted, dev = %s\n", dev_path);
         return;
     }
@@ -220,7 +220,7 @@ void sync_part_with_db(part_info* part)
         overwrite_row(&record, part);
         return;
     }
-    if (is_path_mounted(record.mount_path) == 1) {
+    if (is_path_mounted(record.mount_path) == YES) {
         overwrite_row(&record, part);
         return;
     }

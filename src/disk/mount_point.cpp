@@ -39,7 +39,7 @@ int32_t first_unmounted_number(const mount_table* table, int32_t candidate)
 
 void check_root_part(part_info* root)
 {
-    if (check_part_mounted(root) == 1) {
+    if (check_part_mounted(root) == YES) {
         root->mount_status = 1;
         log_warn("root part already mounted, dev = %s\n", root->dev_name);
     } else {
@@ -55,7 +55,7 @@ void check_sub_parts(disk_obj* disk)
             continue;
         }
         log_info("=== ===> check mount sub part, i = %d, name = %s\n", i, slot->part.dev_name);
-        if (check_part_mounted(&slot->part) == 1) {
+        if (check_part_mounted(&slot->part) == YES) {
             log_info("===> is already mountd\n");
             slot->part.mount_status = 1;
         } else {
@@ -165,7 +165,7 @@ int check_part_mounted(part_info* part)
     }
     char dev_path[PATH_SIZE];
     path_dev_node(dev_path, part->dev_name);
-    if (get_dev_mount_path(dev_path, part->mount_path) != 1) {
+    if (get_dev_mount_path(dev_path, part->mount_path) != YES) {
         return 0;
     }
     log_warn("already mounted, dev = %s\n", dev_path);
@@ -199,7 +199,7 @@ int check_mount_path_dup()
         for (int j = 0; j < table.num; ++j) {
             const mount_entry* a = &table.entries[i];
             const mount_entry* b = &table.entries[j];
-            if (i == j || str_equal(a->path, b->path) != 0) {
+            if (i == j || str_equal(a->path, b->path) != MATCHES) {
                 continue;
             }
             log_info("mount path err:\n");

@@ -104,7 +104,7 @@ void parse_mount_point_num(const char* path, int32_t* main_number, int32_t* sub_
 int find_mount_by_dev(const mount_table* table, const char* dev_path)
 {
     for (int i = 0; table != nullptr && i < table->num; ++i) {
-        if (str_equal_nullsafe(table->entries[i].dev, dev_path) == 0) {
+        if (str_equal_nullsafe(table->entries[i].dev, dev_path) == MATCHES) {
             return i;
         }
     }
@@ -114,7 +114,7 @@ int find_mount_by_dev(const mount_table* table, const char* dev_path)
 int find_mount_by_path(const mount_table* table, const char* path)
 {
     for (int i = 0; table != nullptr && i < table->num; ++i) {
-        if (str_equal_nullsafe(table->entries[i].path, path) == 0) {
+        if (str_equal_nullsafe(table->entries[i].path, path) == MATCHES) {
             return i;
         }
     }
@@ -152,7 +152,7 @@ int get_dev_mount_path(const char* dev_path, char* out)
     int mounted = 0;
     for (int i = 0; i < table.num; ++i) {
         const mount_entry* entry = &table.entries[i];
-        if (str_equal(entry->dev, dev_path) != 0) {
+        if (str_equal(entry->dev, dev_path) != MATCHES) {
             continue;
         }
         mounted = 1;

@@ -4,6 +4,8 @@
 #include <cstddef>
 #include <cstdint>
 
+#include "util/answer.h"
+
 constexpr int MOUNT_TABLE_SIZE = 16;
 constexpr size_t MOUNT_DEV_SIZE = 32;
 constexpr size_t MOUNT_PATH_SIZE = 128;

@@ -30,7 +30,7 @@ void fill_uid(part_info* part)
 // Some FAT sticks come from the factory with a serial number for a label; nobody knows theirs.
 bool is_factory_label(const part_info* part)
 {
-    return part->fs_type == FS_FAT && str_count_char_at_least(part->label, FAT_LABEL_DASHES) == 1;
+    return part->fs_type == FS_FAT && str_count_char_at_least(part->label, FAT_LABEL_DASHES) == YES;
 }
 
 void fill_label(part_info* part)

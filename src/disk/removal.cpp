@@ -19,7 +19,7 @@ void umount_until_gone(const char* dev_path)
 {
     char mounted_at[MOUNT_PATH_SIZE]{};
     for (int i = 0; i < UMOUNT_TRIES; ++i) {
-        if (get_dev_mount_path(dev_path, mounted_at) != 1) {
+        if (get_dev_mount_path(dev_path, mounted_at) != YES) {
             return;
         }
         fs_umount(mounted_at);
@@ -123,7 +123,7 @@ int remove_dev(disk_sets* sets, const char* dev_name)
     }
     // A disk that the kernel no longer lists goes the partition's way, which leaves its entry: "A
     // pulled disk stays until its partitions are told" in docs/limits.md.
-    if (sys_block_has_dev(dev_name) != 0) {
+    if (sys_block_has_dev(dev_name) != MATCHES) {
         log_warn("remove sub dev = %s\n", dev_name);
         remove_sub_part(sets, dev_name);
     } else {
@@ -167,7 +167,7 @@ int safe_remove_all(disk_sets* sets)
             return 1;
         }
         while (const char* name = dir.next_name()) {
-            if (dev_name_is_disk(name) == 0) {
+            if (dev_name_is_disk(name) == MATCHES) {
                 remove_dev(sets, name);
             }
         }

@@ -39,7 +39,7 @@ bool is_system_disk(const char* root_dev)
         return false;
     }
     while (const char* name = dir.next_name()) {
-        if (dev_name_is_disk(name) == 0 && is_system_device(name)) {
+        if (dev_name_is_disk(name) == MATCHES && is_system_device(name)) {
             return true;
         }
     }

@@ -123,6 +123,7 @@ fs_code probe_hfsplus(int fd)
     if (!header.read(fd, SUPERBLOCK_OFFSET)) {
         return FS_NONE;
     }
+    // "HFS+ with a journal" in docs/limits.md.
     const bool journaled = (header.bytes[HFSPLUS_ATTRIBUTES_OFFSET] & HFSPLUS_JOURNALED) != 0;
     return !journaled && header.holds(0, "H+") ? FS_HFSPLUS : FS_NONE;
 }
@@ -185,6 +186,19 @@ constexpr bool each_filesystem_is_probed()
     return true;
 }
 static_assert(each_filesystem_is_probed(), "each filesystem is in the row of a probe");
+
+constexpr bool each_probe_finds_filesystems()
+{
+    for (const probe& row : PROBES) {
+        for (const fs_code code : row.codes) {
+            if (code >= FS_CODE_COUNT) {
+                return false;
+            }
+        }
+    }
+    return true;
+}
+static_assert(each_probe_finds_filesystems(), "what a probe finds is in the table of filesystems");
 
 }  // namespace
 

@@ -112,6 +112,8 @@ int fs_blkid_type(const char* dev_path, char* out, size_t size)
     if (answer.text == nullptr) {
         return 1;
     }
+    // The first TYPE may be that of SEC_TYPE: "ext3 and some ext4 volumes" and "FAT recognised by
+    // blkid alone" in docs/limits.md.
     const blkid_value type = blkid_find(answer.text, "TYPE=", BLKID_QUOTE);
     if (type.text == nullptr) {
         return 1;
@@ -126,7 +128,7 @@ int dev_has_fs_type(const char* dev_name)
     char dev_path[DEV_PATH_SIZE];
     path_dev_node(dev_path, dev_name);
     char type[FS_TYPE_TEXT_SIZE]{};
-    return fs_blkid_type(dev_path, type, sizeof(type)) == 0 ? 1 : 0;
+    return fs_blkid_type(dev_path, type, sizeof(type)) == 0 ? YES : NO;
 }
 
 int fs_type_hook(fs_code fs_type, const char* dev_path)

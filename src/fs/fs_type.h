@@ -3,13 +3,14 @@
 
 #include <cstddef>
 
+#include "util/answer.h"
 #include "util/fs_code.h"
 
 // Room for a TYPE value of blkid with its terminating zero; longer ones are cut.
 constexpr size_t FS_TYPE_TEXT_SIZE = 16;
 
 // The display name of a code; that of FS_NONE for a value that is no code.
-const char* fs_type_name(fs_code fs_type);
+[[nodiscard]] const char* fs_type_name(fs_code fs_type);
 
 // The type code of the filesystem on a device node; 0 when nothing is recognised or the device
 // cannot be opened. The device is only read.
@@ -29,5 +30,5 @@ int fs_type_hook(fs_code fs_type, const char* dev_path);
 // The display names, indexed by code.
 extern const char* const (&fs_type_names)[FS_CODE_COUNT];
 
-// 1 when blkid reports a TYPE for a device name, else 0.
+// YES when blkid reports a TYPE for a device name, else NO.
 int dev_has_fs_type(const char* dev_name);

@@ -57,7 +57,7 @@ scan_result add_all_disks(disk_sets* disks)
     bool have_disk = false;
     while (const char* name = dir.next_name()) {
         log_info("d_name = %s\n", name);
-        if (dev_name_is_disk(name) == 0) {
+        if (dev_name_is_disk(name) == MATCHES) {
             disk_sets_add_dev(disks, name);
             have_disk = true;
         }
@@ -80,7 +80,7 @@ bool is_needed(time_t* last, time_t now)
         return true;
     }
     log_warn("sys timeout, %d > %d\n", static_cast<int>(silence), life.sys_timeout);
-    if (proc_exists(COMPANION_PROCESS) == 0) {
+    if (proc_exists(COMPANION_PROCESS) != YES) {
         return false;
     }
     *last = now;
@@ -165,8 +165,8 @@ void publish_when_due(disk_manager* manager, time_t now)
 // starts again with a fresh database. Both are looked for, since each logs what it finds.
 void check_mount_consistency()
 {
-    const bool path_twice = check_mount_path_dup() != 0;
-    const bool dev_gone = check_mount_dev_exist() != 0;
+    const bool path_twice = check_mount_path_dup() == YES;
+    const bool dev_gone = check_mount_dev_exist() == YES;
     if (!path_twice && !dev_gone) {
         return;
     }

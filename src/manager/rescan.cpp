@@ -35,7 +35,7 @@ bool read_block_names(block_names* list)
     }
     int used = 0;
     while (const char* name = dir.next_name()) {
-        if (dev_name_is_disk(name) == 0 && used < BLOCK_LIST_SIZE) {
+        if (dev_name_is_disk(name) == MATCHES && used < BLOCK_LIST_SIZE) {
             text_copy(list->names[used++], name);
         }
     }
@@ -46,7 +46,7 @@ bool read_block_names(block_names* list)
 bool holds(const block_names& list, const char* name)
 {
     for (const auto& slot : list.names) {
-        if (str_equal(slot, name) == 0) {
+        if (str_equal(slot, name) == MATCHES) {
             return true;
         }
     }

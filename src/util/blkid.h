@@ -17,8 +17,7 @@ inline constexpr char BLKID_WORD_ENDS[] = "\" ";
 
 // The value behind the first occurrence of key (with its "=") and the quote that follows; empty
 // when the text ends at the key. The key matches anywhere, so a longer one that ends the same and
-// stands first wins: "ext3 and some ext4 volumes", "FAT recognised by blkid alone" and "Names of
-// unlabelled GPT partitions" in docs/limits.md.
+// stands first wins: "Names of unlabelled GPT partitions" in docs/limits.md.
 [[nodiscard]] blkid_value blkid_find(const char* line, const char* key, const char* ends);
 
 // True when the line is that of the device: blkid prints nothing of one that it does not know.

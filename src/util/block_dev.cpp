@@ -69,14 +69,16 @@ void query_blkid(const char* format, const char* dev_name, const char* key, char
 int dev_name_is_disk(const char* name)
 {
     if (name == nullptr || strlen(name) < MIN_NAME_LENGTH || !name_is_plain(name)) {
-        return 1;
+        return NO_MATCH;
     }
+    // Other names are those of devices that are not disks of a user's, and some that are: "Names
+    // beginning with sd, hd and mmcblk only" in docs/limits.md.
     for (const char* prefix : {"sd", "hd", "mmcblk"}) {
         if (text_has_prefix(name, prefix)) {
-            return 0;
+            return MATCHES;
         }
     }
-    return 1;
+    return NO_MATCH;
 }
 
 int sys_block_has_dev(const char* name)
@@ -89,21 +91,21 @@ int sys_block_find_parent(const char* part_name, char* out, size_t size)
     dir_stream dir(SYS_BLOCK);
     if (dir.stream == nullptr) {
         log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return 1;
+        return NO_MATCH;
     }
     while (const char* disk_name = dir.next_name()) {
-        if (dev_name_is_disk(disk_name) != 0) {
+        if (dev_name_is_disk(disk_name) != MATCHES) {
             continue;
         }
         char path[PATH_SIZE];
         path_sys_disk(path, disk_name);
-        if (dir_has_entry(path, part_name) == 0) {
+        if (dir_has_entry(path, part_name) == MATCHES) {
             log_info("find dev = %s, in root path = %s\n", part_name, path);
             text_copy({out, size}, disk_name);
-            return 0;
+            return MATCHES;
         }
     }
-    return 1;
+    return NO_MATCH;
 }
 
 void dev_get_sectors(const char* disk_name, const char* dev_name, uint64_t* sectors)

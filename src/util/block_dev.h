@@ -5,14 +5,17 @@
 #include <cstddef>
 #include <cstdint>
 
-// 0 when the daemon handles devices of that name: at least 3 characters, beginning with "sd",
-// "hd" or "mmcblk", and fit for a shell command. Else 1.
+#include "util/answer.h"
+
+// MATCHES when the daemon handles devices of that name: at least 3 characters, beginning with "sd",
+// "hd" or "mmcblk", and plain (util/paths).
 int dev_name_is_disk(const char* name);
 
-// 0 when name is a whole disk, that is an entry of /sys/block, else 1.
+// MATCHES when name is a whole disk, that is an entry of /sys/block.
 int sys_block_has_dev(const char* name);
 
-// Finds the disk whose directory holds the partition. 0 and the disk's name in out, else 1.
+// Finds the disk whose directory holds the partition. MATCHES and the disk's name in out, else
+// NO_MATCH.
 int sys_block_find_parent(const char* part_name, char* out, size_t size);
 
 // The kernel's sector count; written to sectors only on success.

@@ -16,7 +16,8 @@
 
 namespace {
 
-// Somebody may put a new thing there between our steps; nobody can for ever.
+// Somebody may put a new thing there between our steps. A try is two system calls: nobody wins so
+// many of these races in a row, and if they did, nothing would run or be read.
 constexpr int CLAIM_TRIES = 100;
 constexpr mode_t PRIVATE_MODE = 0600;
 

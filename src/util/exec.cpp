@@ -21,6 +21,7 @@ int run_system(const char* command)
     struct sigaction previous {};
     standard.sa_handler = SIG_DFL;
     const bool changed = sigaction(SIGCHLD, &standard, &previous) == 0;
+    // A SIGINT that arrives meanwhile is lost: "One SIGINT can be lost" in docs/limits.md.
     const int status = system(command);
     if (changed) {
         sigaction(SIGCHLD, &previous, nullptr);

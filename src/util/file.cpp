@@ -18,6 +18,9 @@
 namespace {
 
 constexpr mode_t PRIVATE_MODE = 0600;
+
+// The same race as in util/claim; but a try starts a shell, so that fewer can be won and fewer must
+// do.
 constexpr int DIR_MAKE_TRIES = 8;
 
 int write_all(FILE* stream, const void* bytes, int32_t length)
@@ -52,19 +55,19 @@ bool path_exists(const char* path)
 int dir_has_entry(const char* path, const char* name)
 {
     if (path == nullptr || name == nullptr) {
-        return 1;
+        return NO_MATCH;
     }
     dir_stream dir(path);
     if (dir.stream == nullptr) {
         log_err("open dir err, dir = %s\n", path);
-        return 1;
+        return NO_MATCH;
     }
     while (const char* entry = dir.next_name()) {
-        if (str_equal(entry, name) == 0) {
-            return 0;
+        if (str_equal(entry, name) == MATCHES) {
+            return MATCHES;
         }
     }
-    return 1;
+    return NO_MATCH;
 }
 
 int64_t file_get_size(const char* path, uint8_t* exists)

@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <span>
 
+#include "util/answer.h"
 #include "util/guard.h"
 
 // Largest file that file_read_all takes: a runaway scratch file must not exhaust a router's memory.
@@ -27,9 +28,9 @@ struct dir_stream {
 };
 
 // True when something exists at path.
-bool path_exists(const char* path);
+[[nodiscard]] bool path_exists(const char* path);
 
-// 0 when the directory holds an entry of exactly that name, else 1.
+// MATCHES when the directory holds an entry of exactly that name.
 int dir_has_entry(const char* path, const char* name);
 
 // Size in bytes, 0 on failure; exists (may be null) becomes 1 on success and 0 on failure.

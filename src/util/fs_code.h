@@ -54,4 +54,4 @@ inline constexpr filesystem FILESYSTEMS[] = {
 constexpr int32_t FS_CODE_COUNT = std::size(FILESYSTEMS);
 
 // The row of a code; that of FS_NONE for a number that is no code.
-const filesystem& filesystem_of(fs_code code);
+[[nodiscard]] const filesystem& filesystem_of(fs_code code);

@@ -26,8 +26,8 @@ int proc_pid_of(const char* name)
 int proc_exists(const char* name)
 {
     if (proc_pid_of(name) != 0) {
-        return 1;
+        return YES;
     }
     log_warn("===> proc not exist, name = %s\n", name);
-    return 0;
+    return NO;
 }

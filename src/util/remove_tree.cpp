@@ -16,6 +16,8 @@
 
 namespace {
 
+// Without a pause: they help against what passes at once, like a file that came into a directory in
+// between, and a lasting refusal is soon known.
 constexpr int REMOVE_TRIES = 3;
 
 bool removed_in_tries(const char* path, int (*remove_call)(const char*))

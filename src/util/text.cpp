@@ -52,13 +52,13 @@ bool text_has_prefix(const char* text, const char* prefix)
 
 int str_equal(const char* a, const char* b)
 {
-    return strcmp(a, b) == 0 ? 0 : 1;
+    return strcmp(a, b) == 0 ? MATCHES : NO_MATCH;
 }
 
 int str_equal_nullsafe(const char* a, const char* b)
 {
     if (a == nullptr || b == nullptr) {
-        return 1;
+        return NO_MATCH;
     }
     return str_equal(a, b);
 }
@@ -66,7 +66,7 @@ int str_equal_nullsafe(const char* a, const char* b)
 int str_count_char_at_least(const char* text, int count)
 {
     if (text == nullptr) {
-        return 1;
+        return YES;
     }
     int dashes = 0;
     for (const char* c = text; *c != '\0'; ++c) {
@@ -74,5 +74,5 @@ int str_count_char_at_least(const char* text, int count)
             ++dashes;
         }
     }
-    return dashes >= count ? 1 : 0;
+    return dashes >= count ? YES : NO;
 }

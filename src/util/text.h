@@ -4,6 +4,8 @@
 #include <cstddef>
 #include <span>
 
+#include "util/answer.h"
+
 // Copies text into out and zero-fills the rest; cut at one character less than out, always
 // terminated. An out of no bytes is left alone.
 void text_copy(std::span<char> out, const char* text);
@@ -22,11 +24,11 @@ void text_clear(std::span<char> out);
 
 [[nodiscard]] bool text_has_prefix(const char* text, const char* prefix);
 
-// 0 when both have the same length and the same bytes, else 1.
+// MATCHES when both have the same length and the same bytes.
 int str_equal(const char* a, const char* b);
 
-// 1 when either is null, else as str_equal.
+// NO_MATCH when either is null, else as str_equal.
 int str_equal_nullsafe(const char* a, const char* b);
 
-// 1 when text holds at least count "-" characters, else 0; 1 for a null text.
+// YES when text holds at least count "-" characters, also for a null text.
 int str_count_char_at_least(const char* text, int count);
