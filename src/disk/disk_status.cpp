@@ -2,25 +2,19 @@
 
 #include <cjson/cJSON.h>
 
-#include <cstdlib>
-#include <cstring>
-
 #include "fs/fs_type.h"
 #include "log/log.h"
-#include "util/file.h"
 #include "util/guard.h"
 #include "util/paths.h"
+#include "util/publish.h"
 #include "util/text.h"
 
 namespace {
 
 constexpr size_t COUNT_SIZE = 32;
-constexpr char NO_DISK_JSON[] = "{\"disk_number\": 0, \"disk\": []}";
+using json_guard = guard<cJSON*, nullptr, cJSON_Delete>;
 
-int write_text(const char* path, const char* text)
-{
-    return file_write(path, text, static_cast<int32_t>(strlen(text)));
-}
+constexpr char NO_DISK_JSON[] = "{\"disk_number\": 0, \"disk\": []}";
 
 // Gives the item to the object. What cannot be added is let go: the document gets smaller.
 bool add_item(cJSON* object, const char* key, cJSON* item)
@@ -101,13 +95,9 @@ void add_disk(cJSON* array, disk_obj* disk)
     fill_disk(object, disk);
 }
 
-void print_to_file(const cJSON* root)
+bool publish(const char* path, const char* text)
 {
-    const text_guard text(cJSON_Print(root));
-    if (text == nullptr) {
-        return;
-    }
-    write_text(DISK_JSON_FILE, text);
+    return file_publish(path, STATUS_NEW_FILE, text);
 }
 
 }  // namespace
@@ -124,7 +114,7 @@ int disk_status_write_json(disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
-    cJSON* root = cJSON_CreateObject();
+    const json_guard root(cJSON_CreateObject());
     if (root == nullptr) {
         log_err("err!\n");
         return 1;
@@ -132,13 +122,11 @@ int disk_status_write_json(disk_sets* sets)
     cJSON* disks = cJSON_CreateArray();
     if (disks == nullptr) {
         log_err("err!\n");
-        cJSON_Delete(root);
         return 1;
     }
     add_number(root, "disk_number", disk_sets_count(sets));
     // Without its list a document says nothing: the old file stays.
     if (!add_item(root, "disk", disks)) {
-        cJSON_Delete(root);
         return 1;
     }
     for (disk_entry& entry : sets->entries) {
@@ -146,8 +134,12 @@ int disk_status_write_json(disk_sets* sets)
             add_disk(disks, &entry.disk);
         }
     }
-    print_to_file(root);
-    cJSON_Delete(root);
+    const text_guard text(cJSON_Print(root));
+    if (text == nullptr) {
+        return 0;
+    }
+    // A failure is logged, the old document stays, and the next publication comes in any case.
+    static_cast<void>(publish(DISK_JSON_FILE, text));
     return 0;
 }
 
@@ -158,10 +150,10 @@ int disk_status_write_count(const disk_sets* sets)
     }
     char text[COUNT_SIZE];
     text_format(text, "%d", disk_sets_count(sets));
-    return write_text(DISK_NUM_FILE, text);
+    return publish(DISK_NUM_FILE, text) ? 0 : 1;
 }
 
 int disk_status_write_empty_json()
 {
-    return write_text(DISK_JSON_FILE, NO_DISK_JSON);
+    return publish(DISK_JSON_FILE, NO_DISK_JSON) ? 0 : 1;
 }

@@ -67,25 +67,31 @@ int free_name(const char* path)
 
 }  // namespace
 
-int claim_file(const char* path)
+int claim_open(const char* path, mode_t mode)
 {
     if (path == nullptr) {
-        return 1;
+        return -1;
     }
     for (int i = 0; i < CLAIM_TRIES; ++i) {
         if (free_name(path) != 0) {
-            return 1;
+            return -1;
         }
-        const fd_guard file(open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, PRIVATE_MODE));
-        if (file >= 0) {
-            return 0;
+        const int fd = open(path, O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode);
+        if (fd >= 0) {
+            return fd;
         }
         if (errno != EEXIST) {
             break;
         }
     }
     log_errno("claim err, path = %s\n", path);
-    return 1;
+    return -1;
+}
+
+int claim_file(const char* path)
+{
+    const fd_guard file(claim_open(path, PRIVATE_MODE));
+    return file >= 0 ? 0 : 1;
 }
 
 path_owner path_get_owner(const char* path)

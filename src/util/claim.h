@@ -2,9 +2,15 @@
 // system, a directory of their own. What somebody else put there is never followed or used.
 #pragma once
 
-// Puts an empty file, readable and writable by us alone, in place of whatever lies at path. Where
-// /tmp is sticky, nobody else can take it away again. 0, or 1 when it cannot be made.
-int claim_file(const char* path);
+#include <sys/types.h>
+
+// Puts an empty file of that mode, less the umask, in place of whatever lies at path, and opens it
+// for writing. The caller owns the descriptor; -1 when it cannot be made, which is logged.
+[[nodiscard]] int claim_open(const char* path, mode_t mode);
+
+// The same, readable and writable by us alone and closed again. Where /tmp is sticky, nobody else
+// can take it away. 0, or 1 when it cannot be made.
+[[nodiscard]] int claim_file(const char* path);
 
 enum path_owner {
     PATH_OF_NOBODY,  // nothing is there, or it cannot be told

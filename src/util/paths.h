@@ -14,6 +14,8 @@ inline constexpr char RUNTIME_DIR[] = "/tmp/tarn_nas/";
 inline constexpr char PID_FILE[] = "/tmp/tarn_nas//disk_manager_pid";
 inline constexpr char DISK_JSON_FILE[] = "/tmp/tarn_nas//disk.json";
 inline constexpr char DISK_NUM_FILE[] = "/tmp/tarn_nas//disk_num.txt";
+// Where both of them are written before they take their names.
+inline constexpr char STATUS_NEW_FILE[] = "/tmp/tarn_nas/status.new";
 inline constexpr char PIPE_ADD_REMOVE[] = "/tmp/tarn_nas/pipe_disk_add_remove";
 inline constexpr char PIPE_SAFE_REMOVE[] = "/tmp/tarn_nas/pipe_disk_safe_remove";
 inline constexpr char PIPE_REMOVE[] = "/tmp/tarn_nas/pipe_disk_remove";

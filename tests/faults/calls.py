@@ -77,8 +77,9 @@ CALLS = (
     Call(("sendto",), ("ENOMEM", "EAGAIN", "EINTR"), stages=("syslog",)),
     Call(("mkdir", "mkdirat"), ("ENOSPC", "EIO", "ENOMEM"), hides=True,
          stages=("planted",)),
+    # Without it the last document stays, and a foreign thing where it is.
     Call(("rename", "renameat", "renameat2"), ("ENOSPC", "EIO", "EACCES"), hides=True,
-         stages=("planted",)),
+         stages=("start", "cycle", "planted"), rare=True),
     Call(("rmdir",), ("EIO", "EACCES", "ENOMEM"), hides=True,
          stages=("planted",)),
 )

@@ -8,7 +8,7 @@ from faults.starting import Starts
 from shared.strace import Strace
 
 from world import Partition
-from world.state import DISK_DB, DISK_JSON, PID_FILE
+from world.state import DISK_DB, DISK_JSON, PID_FILE, STATUS_NEW
 
 pytestmark = pytest.mark.needs_fs("ext4")
 
@@ -20,7 +20,6 @@ PAGE = 4096
 SLACK = 4
 # Once nothing has changed for 30 s the files are written in each cycle.
 NEXT_PUBLICATION = (30 + 3 + 8) / HASTE + SLACK
-PUBLISHED = "clear empty disk"
 
 
 def fill(world, folder):
@@ -29,6 +28,10 @@ def fill(world, folder):
         world.sh(f"cat /dev/zero >> {folder}/{FILLER}", check=False)
         return os.statvfs(world.path(folder)).f_bavail == 0
     world.wait(full, 10, f"a full {folder}")
+
+
+def failed_publication(daemon):
+    daemon.wait_log("publish err, fn = /tmp/tarn_nas//disk.json", NEXT_PUBLICATION, daemon.mark())
 
 
 def remount(world, options, target):
@@ -85,29 +88,7 @@ def test_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
     assert daemon.stop() == 0
 
 
-def test_status_emptied_by_a_full_tmp_is_whole_again_with_a_later_cycle(rig):
-    world, daemon = rig.world, rig.daemon
-    # From now on the files are written in each cycle.
-    daemon.wait_log(PUBLISHED, NEXT_PUBLICATION, daemon.mark())
-    fill(world, "/tmp")
-    # What the daemon had there meanwhile is gone, and leaves no room for a document.
-    daemon.wait_idle_cycles(1)
-
-    def emptied():
-        world.path(DISK_JSON).write_text("")
-        fill(world, "/tmp")
-        return world.read(DISK_JSON) == ""
-    world.wait(emptied, 10, "an empty status in a full /tmp")
-    # Without room for pidof's answer, a minute of silence would end it.
-    rig.answer()
-    daemon.wait_log(PUBLISHED, NEXT_PUBLICATION, daemon.mark())
-    daemon.wait_idle_cycles(1)
-    assert world.read(DISK_JSON) == ""
-    world.path(f"/tmp/{FILLER}").unlink()
-    rig.wait_right(NEXT_PUBLICATION)
-
-
-def test_status_cut_in_the_middle_by_a_full_tmp_is_whole_again_with_a_later_cycle(
+def test_status_of_more_than_a_page_stays_whole_in_a_full_tmp_and_with_room_for_half_of_it(
         world, start_daemon, libraries):
     for name in ("sda", "sdb", "sdc"):
         parts = [Partition("swap", 1001) for _ in range(8)]
@@ -118,14 +99,25 @@ def test_status_cut_in_the_middle_by_a_full_tmp_is_whole_again_with_a_later_cycl
     whole = world.read(DISK_JSON)
     assert len(whole) > PAGE
 
-    # Room for one page: the first is written, the second is not.
     fill(world, "/tmp")
-    world.sh(f"rm {DISK_JSON}; cat /dev/zero >> /tmp/{FILLER}", check=False)
-    os.truncate(world.path(f"/tmp/{FILLER}"), world.path(f"/tmp/{FILLER}").stat().st_size - PAGE)
-    world.wait(lambda: world.exists(DISK_JSON) and world.read(DISK_JSON) == whole[:PAGE], 20,
-               "a first page")
-    world.path(f"/tmp/{FILLER}").unlink()
-    world.wait(lambda: world.read(DISK_JSON) == whole, NEXT_PUBLICATION, "the whole document")
+    failed_publication(daemon)
+    assert world.read(DISK_JSON) == whole
+    # Of the next document a first page could be written.
+    filler = world.path(f"/tmp/{FILLER}")
+    os.truncate(filler, filler.stat().st_size - PAGE)
+    failed_publication(daemon)
+    assert world.read(DISK_JSON) == whole
+    # One that is not there is not begun.
+    world.path(DISK_JSON).unlink()
+    fill(world, "/tmp")
+    os.truncate(filler, filler.stat().st_size - PAGE)
+    failed_publication(daemon)
+    assert not world.exists(DISK_JSON)
+    assert not world.exists(STATUS_NEW)
+
+    filler.unlink()
+    world.wait(lambda: world.exists(DISK_JSON), NEXT_PUBLICATION, "a document")
+    assert world.read(DISK_JSON) == whole
     assert daemon.stop() == 0
 
 

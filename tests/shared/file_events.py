@@ -6,18 +6,18 @@ import select
 import struct
 import time
 
-IN_MODIFY, IN_CREATE, IN_DELETE = 0x2, 0x100, 0x200
+IN_MODIFY, IN_MOVED, IN_CREATE, IN_DELETE = 0x2, 0xC0, 0x100, 0x200
 _EVENT = struct.Struct("iIII")
 _libc = ctypes.CDLL(None, use_errno=True)
 
 
 class FileEvents:
-    """What is made, written and deleted in some folders from now on."""
+    """What is made, written, renamed and deleted in some folders from now on."""
 
     def __init__(self, *folders):
         self._fd = _libc.inotify_init1(os.O_CLOEXEC | os.O_NONBLOCK)
         for folder in folders:
-            mask = IN_MODIFY | IN_CREATE | IN_DELETE
+            mask = IN_MODIFY | IN_MOVED | IN_CREATE | IN_DELETE
             if _libc.inotify_add_watch(self._fd, os.fsencode(folder), mask) < 0:
                 raise OSError(ctypes.get_errno(), f"cannot watch {folder}")
 

@@ -7,12 +7,10 @@ import jsonschema
 
 from world import CHECKOUT
 from world.state import DISK_JSON, load_json
-from world.waiting import WaitTimeout, wait_for
 
 _SCHEMA = jsonschema.Draft7Validator(
     json.loads((CHECKOUT / "docs/disk.schema.json").read_text()))
 _LOOK_EVERY_SECONDS = 0.1
-_REWRITE_SECONDS = 2
 
 
 def objections(document):
@@ -26,6 +24,12 @@ def objections(document):
     found += [f"part_num is {disk.get('part_num')}, not {len(disk.get('part', []))}"
               for disk in document["disk"] if disk.get("part_num", 0) != len(disk.get("part", []))]
     return found
+
+
+def text_objections(text):
+    """The same of the file's text."""
+    document = load_json(text)
+    return ["no JSON"] if document is None else objections(document)
 
 
 class StatusWatch:
@@ -42,13 +46,10 @@ class StatusWatch:
         self._thread.start()
 
     def stop(self):
-        """Judge the last document as well; it may be halfway through being rewritten."""
+        """Judge the last document as well."""
         self._over.set()
         self._thread.join()
-        try:
-            wait_for(self._look, _REWRITE_SECONDS, "")
-        except WaitTimeout:
-            self.faults.append(f"no JSON:\n{self._world.read(DISK_JSON)}")
+        self._look()
 
     def _watch(self):
         try:
@@ -58,18 +59,14 @@ class StatusWatch:
             self.faults.append(f"the watch broke off: {error!r}")
 
     def _look(self):
-        """Judge what stands there; False when it is no JSON."""
+        """Judge what stands there, once there is something."""
         try:
             text = self._world.read(DISK_JSON)
         except FileNotFoundError:
-            return True
-        document = load_json(text)
-        if document is None:
-            return False
+            return
         if text not in self._seen:
-            self.faults += [f"{fault} in\n{text}" for fault in objections(document)]
+            self.faults += [f"{fault} in\n{text}" for fault in text_objections(text)]
             self._seen.add(text)
-        return True
 
 
 def directories(world):

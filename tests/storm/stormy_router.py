@@ -11,7 +11,7 @@ from shared.file_events import FileEvents
 from shared.published import objections
 
 from world import PIPES, DaemonGone, Partition, WaitTimeout, state
-from world.state import DB_JOURNAL, DISK_DB, DISK_JSON, PID_FILE
+from world.state import DB_JOURNAL, DISK_DB, DISK_JSON, PID_FILE, STATUS_NEW
 
 KERNEL_NAMES = ["sda", "sdb", "sdc", "sdd", "sde"]
 # Those of a cycle and that of the start.
@@ -21,7 +21,7 @@ DATABASE_INSTANTS = [("/etc/config/tarn_nas", "disk.db-journal", 24),
                      ("/etc/config/tarn_nas", "disk.db-journal", 4),
                      ("/etc/config/tarn_nas", "disk.db", 8)]
 FILE_INSTANTS = [*DATABASE_INSTANTS, *DATABASE_INSTANTS,
-                 ("/tmp/tarn_nas", "disk.json", 6), ("/tmp/tarn_nas", "disk_num.txt", 4),
+                 ("/tmp/tarn_nas", "status.new", 12), ("/tmp/tarn_nas", "disk.json", 3),
                  ("/tmp/tarn_nas", "disk_manager_pid", 2), ("/tmp/tarn_nas", "pipe_disk_remove", 2),
                  ("/tmp", "mount.txt", 30), ("/tmp", "disk_uid.txt", 20), ("/tmp", "out.txt", 20),
                  ("/tmp", "tmp_blkid", 20), ("/tmp", "disk_pid_tmp", 3)]
@@ -216,12 +216,14 @@ class StormyRouter:
         # A supervisor starts the next run seconds later: commands of the dead one have ended.
         world.wait(lambda: not self._orphans(), 20, "the last command of the killed daemon")
         self.check_rows()
+        # Whatever the instant, a reader finds a whole document.
+        assert not world.exists(DISK_JSON) or world.disk_json() is not None
         if any(text in self.daemon.log() for text in SELF_CHECK):
             self.self_checks += 1
             self.plug_all()
         left = {"stale pid file": world.exists(PID_FILE), "mounts": bool(world.mounts()),
                 "scratch file": bool(self._scratch()), "cut-off transaction": self._has_journal(),
-                "half disk.json": world.exists(DISK_JSON) and world.disk_json() is None,
+                "status file on its way": world.exists(STATUS_NEW),
                 "no database file": not world.exists(DISK_DB)}
         return [name for name, holds in left.items() if holds]
 
@@ -229,7 +231,7 @@ class StormyRouter:
         """Leave what a kill at a moment too short to be met by chance would leave."""
         if self.random.random() < 0.2 and self.world.exists(DISK_JSON):
             text = self.world.read(DISK_JSON)
-            self.world.write(DISK_JSON, text[:self.random.randrange(len(text) + 1)])
+            self.world.write(STATUS_NEW, text[:self.random.randrange(len(text) + 1)])
         for path in SCRATCH:
             if self.random.random() < 0.2:
                 self.world.write(path, '/dev/sda: UUID="stale" TYPE="ntfs"\n' * 3)

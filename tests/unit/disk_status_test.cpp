@@ -1,8 +1,11 @@
 #include "disk/disk_status.h"
 
 #include <cjson/cJSON.h>
+#include <sys/mount.h>
 
+#include <filesystem>
 #include <memory>
+#include <set>
 #include <string>
 
 #include "support_disk/disk_world.h"
@@ -271,6 +274,37 @@ TEST_F(DiskStatus, a_shorter_document_leaves_nothing_of_the_longer_one_before)
     EXPECT_NE(published(), nullptr);
     EXPECT_LT(read_file(DISK_JSON_FILE).size(), 100U);
     EXPECT_EQ(read_file(DISK_NUM_FILE), "0");
+}
+
+TEST_F(DiskStatus, in_a_full_tmp_both_files_stay_as_they_were_and_results_say_so)
+{
+    put_root(&sets.entries[0], "sda", 5000);
+    put_mounted(0, 0, "sda1", "disk1_part1");
+    ASSERT_EQ(mount("tmpfs", RUNTIME_DIR, "tmpfs", 0, "size=8k"), 0);
+    disk_sets_publish(&sets);
+    const std::string document = read_file(DISK_JSON_FILE);
+    put_mounted(0, 1, "sda2", "disk1_part2");
+    const std::string log = capture_stdout([&] {
+        EXPECT_EQ(disk_status_write_json(&sets), 0);
+        EXPECT_EQ(disk_status_write_count(&sets), 1);
+        EXPECT_EQ(disk_status_write_empty_json(), 1);
+    });
+    EXPECT_EQ(support::count_of(log, "(No space left on device)publish err, fn = "), 3) << log;
+    EXPECT_EQ(read_file(DISK_JSON_FILE), document);
+    EXPECT_EQ(read_file(DISK_NUM_FILE), "1");
+    EXPECT_EQ(umount(RUNTIME_DIR), 0);
+}
+
+TEST_F(DiskStatus, nothing_stays_beside_the_two_files)
+{
+    support::write_file(STATUS_NEW_FILE, "left by a run that was killed");
+    disk_sets_publish(&sets);
+    EXPECT_EQ(disk_status_write_empty_json(), 0);
+    std::set<std::string> names;
+    for (const auto& entry : std::filesystem::directory_iterator(RUNTIME_DIR)) {
+        names.insert(entry.path().filename());
+    }
+    EXPECT_EQ(names, (std::set<std::string>{"disk.json", "disk_num.txt"}));
 }
 
 TEST_F(DiskStatus, a_missing_runtime_directory_is_only_reported)

@@ -13,6 +13,7 @@ from .waiting import wait_for
 
 DISK_JSON = "/tmp/tarn_nas/disk.json"
 DISK_NUM = "/tmp/tarn_nas/disk_num.txt"
+STATUS_NEW = "/tmp/tarn_nas/status.new"
 DISK_DB = "/etc/config/tarn_nas/disk.db"
 DB_JOURNAL = DISK_DB + "-journal"
 PID_FILE = "/tmp/tarn_nas/disk_manager_pid"
