@@ -7,7 +7,7 @@ import time
 import pytest
 from openwrt.router import BEAT, HEART_BEAT, HELPERS
 
-from world import WaitTimeout, wait_for
+from world import Partition, WaitTimeout, wait_for
 from world.events import PIPES
 from world.state import PID_FILE
 
@@ -177,3 +177,16 @@ def test_without_it_the_daemon_ends(hasty_router):
         lives_on(router, pid, 3 * SILENCE)
     assert "sys timeout" in router.output()
     assert BEAT not in router.output()
+
+
+def test_a_mount_pass_of_more_than_its_patience_ends_the_daemon_all_the_same(hasty_router):
+    router = hasty_router(5)
+    mount = router.world.tools.real("mount")
+    router.world.tools.stub("mount", f'case "$1" in -t) exit 1 ;; *) exec {mount} "$@" ;; esac')
+    pid = router.start()
+    # 18 s for each; the messages wait in the pipe until the pass is over, and then it looks at the time first.
+    router.world.plug(router.world.partitioned_disk(*[Partition(fs="ext4") for _ in range(4)]), "sda")
+    router.uevent("add", "sda", "disk")
+    wait_for(lambda: router.pids() != [pid], 60, "the daemon's end")
+    assert router.output().count("mount ERROR") == 4
+    assert "sys timeout" in router.output()
