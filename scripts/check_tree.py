@@ -13,7 +13,7 @@ SRC = ROOT / "src"
 LAYERS = [["main"], ["manager"], ["disk"], ["fs", "db_sqlite", "config"], ["util"], ["log"]]
 
 FILE_LINES = 400
-HEADER_LINES = 100
+HEADER_LINES = 120
 
 # The log lies below the module that makes the other paths.
 PATH_MAKERS = {"util/paths.h", "util/paths.cpp", "log/log.cpp"}
