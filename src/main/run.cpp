@@ -115,6 +115,7 @@ void write_pid_file()
 
 int init_environment()
 {
+    // Nothing is ever written to it: docs/limits.md, "The log is copious".
     log_file_open();
     write_pid_file();
     dir_make_own(MOUNT_BASE);

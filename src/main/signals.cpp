@@ -98,7 +98,8 @@ constinit std::atomic<int32_t>& sigint_count = state.sigint_count;
 
 int setup_signals()
 {
-    // Neither call can fail: these signals can all be handled.
+    // On purpose, and commands inherit it: docs/limits.md, "One SIGINT can be lost". Neither this
+    // nor sigaction can fail for these signals.
     signal(SIGTERM, SIG_IGN);
     struct sigaction action {};
     action.sa_sigaction = on_signal;

@@ -142,6 +142,8 @@ int on_safe_remove(disk_manager* manager)
     safe_remove_all(&manager->disks);
     services_start();
     disk_sets_publish(&manager->disks);
+    // docs/limits.md, "After a safe removal only disks that are plugged or announced again come
+    // back".
     manager->state = MANAGER_SAFE_REMOVED;
     lengthen_sys_timeout();
     return 0;
@@ -289,6 +291,7 @@ int manager_event_loop(disk_manager* manager)
     if (manager == nullptr) {
         return 1;
     }
+    // The system's clock, for this and for all timers: docs/limits.md, "A clock that jumps".
     time_t last = time(nullptr);
     while (running == 1) {
         const time_t now = time(nullptr);
@@ -298,6 +301,7 @@ int manager_event_loop(disk_manager* manager)
             last = now;
             manager_dispatch(manager);
         } else {
+            // A warning although nothing is wrong: people who read the log expect the line.
             log_warn("no event ...\n");
             manager_idle(manager);
         }

@@ -82,16 +82,16 @@ void apply_webdav_rule(uci_context* ctx)
 
 void services_stop()
 {
-    for (const service_commands& service : FILE_SERVICES) {
-        exec_cmd(service.stop, 1);
+    for (const auto& [stop, start] : FILE_SERVICES) {
+        exec_cmd(stop, 1);
     }
 }
 
 // In the order of stopping, not the reverse: none of them needs another.
 void services_start()
 {
-    for (const service_commands& service : FILE_SERVICES) {
-        exec_cmd(service.start, 1);
+    for (const auto& [stop, start] : FILE_SERVICES) {
+        exec_cmd(start, 1);
     }
 }
 

@@ -56,13 +56,8 @@ inline constexpr char RESTART_DAEMON[] = "/etc/init.d/tarn_nas_diskmanager resta
 inline constexpr char RELOAD_FIREWALL[] = "/etc/init.d/firewall reload 2>/dev/null";
 inline constexpr char RESTART_SAMBA[] = "/etc/init.d/samba restart";
 
-struct service_commands {
-    const char* stop;
-    const char* start;
-};
-
-// The services that hold files open on disks, in the order of stopping and of starting.
-inline constexpr service_commands FILE_SERVICES[] = {
+// Each service that holds files open on disks: to stop it, to start it. Both go from top to bottom.
+inline constexpr const char* FILE_SERVICES[][2] = {
     {"/etc/init.d/samba4 stop", "/etc/init.d/samba4 start"},
     {"/etc/init.d/nas_samba3 stop", "/etc/init.d/nas_samba3 start"},
     {"/etc/init.d/tarn_nas_sys_dl stop", "/etc/init.d/tarn_nas_sys_dl start"},

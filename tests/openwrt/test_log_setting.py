@@ -34,7 +34,7 @@ TOLD = [
     "mount_point.cpp(202)mount path err:",
     "mount_point.cpp(81)/dev/sda1 ===> /tmp/mountd/disk1_part1",
     "Warning[mount_point.cpp:221]dev not find, dev = /dev/sda1",
-    "single_instance.cpp(58)===> pid exist, file = /tmp/tarn_nas//disk_manager_pid",
+    "run.cpp(108)===> pid exist, file = /tmp/tarn_nas//disk_manager_pid",
 ]
 
 NOT_TOLD = [

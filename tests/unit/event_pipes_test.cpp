@@ -396,6 +396,19 @@ TEST_F(EventParse, each_keyword_gives_its_code_its_log_name_and_a_name_where_it_
     EXPECT_EQ(code, EVENT_CODE_END - 1) << "event " << code + 1 << " has no row in this test";
 }
 
+TEST_F(EventParse, each_event_stands_in_the_documents_of_its_interface)
+{
+    const std::string document = support::read_file(CHECKOUT "/docs/interfaces.md");
+    const std::string grammar =
+        document.substr(document.find("message    = "), document.find("terminator = "));
+    for (const known_event& event : KNOWN_EVENTS) {
+        const std::string keyword = event.keyword;
+        EXPECT_TRUE(contains(grammar, '"' + keyword + '"')) << keyword << " in the grammar";
+        const std::string row = "| `#" + keyword + (event.carries_name ? ":" : "`");
+        EXPECT_TRUE(contains(document, row)) << keyword << " in the table of messages";
+    }
+}
+
 TEST_F(EventParse, the_type_of_an_event_takes_the_four_bytes_of_its_number)
 {
     EXPECT_EQ(sizeof(pipes.event.type), sizeof(int32_t));
