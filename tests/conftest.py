@@ -33,6 +33,11 @@ def pytest_runtest_setup(item):
             pytest.skip(f"the kernel cannot mount {', '.join(absent)}")
 
 
+def pytest_collection_modifyitems(items):
+    """The longest go first, so that none of them is left alone at the end."""
+    items.sort(key=lambda item: item.get_closest_marker("takes_minutes") is None)
+
+
 @pytest.hookimpl(hookwrapper=True)
 def pytest_runtest_makereport(item):
     """Put the worlds' state and the daemon's log beside a failed test."""
