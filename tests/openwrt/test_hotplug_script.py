@@ -98,9 +98,12 @@ def test_a_burst_of_parallel_events_loses_none_and_mixes_none(router):
 
 
 def test_without_a_pipe_nothing_happens(router):
-    began = time.monotonic()
-    router.uevent("add", "sda", "disk")
-    assert time.monotonic() - began < 2
+    def seconds():
+        began = time.monotonic()
+        router.uevent("add", "sda", "disk")
+        return time.monotonic() - began
+    # One that waited for a reader would take 2 s each time; a busy machine does not.
+    assert min(seconds() for _ in range(5)) < 2
     assert not router.world.exists(PIPE)
 
 
@@ -140,7 +143,7 @@ def test_a_full_pipe_holds_the_event_up_for_seconds_only_and_is_logged(router):
     os.close(fd)
     began = time.monotonic()
     router.uevent("add", "sda", "disk")
-    assert 1 < time.monotonic() - began < 6
+    assert 1 < time.monotonic() - began < 20
     syslog.wait_message("lost #add:sda", ident="tarn_nas_diskmanager", timeout=5)
 
 
@@ -168,12 +171,11 @@ def test_a_hundred_events_wait_for_a_busy_daemon(router):
 
 
 def quiet_moment(router):
-    """Wait until the daemon has just begun to wait for events, some 2 s before it acts on its own."""
-    def idle_cycles():
-        return router.output().count("no event ...")
-    before = idle_cycles()
-    wait_for(lambda: idle_cycles() > before, 30, "an idle cycle")
-    time.sleep(0.5)
+    """Wait until the daemon has done all that was sent, almost 3 s before it acts on its own."""
+    # Of this pipe the messages are taken last.
+    message = f"#heart_beat:{len(router.output())}"
+    router.world.send(message, pipe="remove", timeout=60)
+    wait_for(lambda: f"get event = {message}\n" in router.output(), 60, f"{message} to be read")
 
 
 STOPPED = [(name, "stop") for name in ("samba4", "nas_samba3", "tarn_nas_sys_dl", "tarn_nas_sys_up")]
@@ -209,7 +211,7 @@ def test_a_pulled_disk_stops_the_real_daemons_services_once_for_each_partition(r
         real_router.uevent("remove", name)
     real_router.uevent("remove", "sda", "disk")
     wait_for(lambda: not world.mounted(), 30, "the unmounts")
+    wait_for(lambda: (world.disk_json() or {}).get("disk_number") == 0, 30, "an empty inventory")
     quiet_moment(real_router)
     assert service_calls(real_router).count(("samba4", "stop")) == 2
-    assert world.disk_json()["disk_number"] == 0
     assert "manager work again!" not in real_router.output()

@@ -48,7 +48,7 @@ class Strace:
         # To leave in the middle of a call that fails would turn it into one that the
         # kernel does not know.
         with contextlib.suppress(WaitTimeout):
-            wait_for(self._between_cycles, _QUIET, "", 0.01)
+            wait_for(self._at_rest, _QUIET, "", 0.01)
         self._process.send_signal(signal.SIGTERM)
         self._process.communicate(timeout=_END)
 
@@ -67,12 +67,8 @@ class Strace:
             raise AssertionError(self._why_not())
         return _tracer(self._daemon.outer_pid) == self._process.pid
 
-    def _between_cycles(self):
-        try:
-            place = Path(f"/proc/{self._daemon.outer_pid}/wchan").read_text()
-        except OSError:
-            return True
-        return "select" in place or "poll" in place
+    def _at_rest(self):
+        return self._daemon.waits_for_events() or not self._daemon.running
 
     def _why_not(self):
         if self._process.poll() is None:

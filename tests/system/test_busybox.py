@@ -166,6 +166,7 @@ def test_second_instance_is_refused_and_a_stale_pid_file_is_not(router):
     assert not router.exists(PID_FILE)
 
 
+@pytest.mark.takes_minutes
 def test_companion_is_found_by_name_when_the_silence_is_too_long(router):
     router.start_companion()
     daemon = router.start_daemon()

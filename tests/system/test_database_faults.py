@@ -121,7 +121,7 @@ def test_read_only_database_is_still_read_and_a_remembered_directory_kept(world,
     assert [(row["disk_name"], row["mountd"]) for row in world.db_rows()] == [
         ("disk7_part2", "no")]
     world.safe_remove()
-    world.wait(lambda: world.mounted() == {}, 20, "the unmount")
+    world.wait(lambda: world.mounted() == {}, 30, "the unmount")
     assert daemon.running
 
 
@@ -187,10 +187,10 @@ def test_uid_in_two_rows_uses_the_first_and_changes_neither(world, start_daemon)
     assert "uid not exist" in daemon.log()
     assert world.db_rows() == before
 
-    world.wait(lambda: "sda" in world.parts(), 20, "sda in disk.json")
+    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
     assert world.parts()["sda"].disk_name == "disk5_part5"
     world.safe_remove()
-    world.wait(lambda: world.mounted() == {}, 20, "the unmount")
+    world.wait(lambda: world.mounted() == {}, 30, "the unmount")
     assert world.db_rows() == before
 
 
@@ -212,8 +212,8 @@ def test_quotes_in_a_uid_harm_nothing_and_the_directory_is_remembered(world, sta
     assert f"insert into disk values('{uid}','sda','disk1_part1'," in daemon.log()
 
     world.safe_remove()
-    world.wait(lambda: world.mounted() == {}, 20, "the unmount")
-    world.wait(lambda: world.db_rows()[1]["mountd"] == "no", 10, "the note of the unmount")
+    world.wait(lambda: world.mounted() == {}, 30, "the unmount")
+    world.wait(lambda: world.db_rows()[1]["mountd"] == "no", 30, "the note of the unmount")
     assert len(world.db_rows()) == 2
 
 

@@ -63,6 +63,7 @@ def footprint(world, daemon):
             "rows": [row["mountd"] for row in world.db_rows()]}
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_a_hundred_rounds_of_plug_and_pull_leak_no_mount_descriptor_or_byte(world, start_daemon):
     daemon = start_daemon(environ=COMPACT_HEAP)
@@ -74,7 +75,7 @@ def test_a_hundred_rounds_of_plug_and_pull_leak_no_mount_descriptor_or_byte(worl
     assert footprint(world, daemon) == before
     assert before["rows"] == ["no"]
     assert daemon.rss_kib() - rss < 64
-    world.wait(lambda: world.disk_num() in ("0", None), 20, "an empty inventory")
+    world.wait(lambda: world.disk_num() in ("0", None), 30, "an empty inventory")
 
 
 def send_all_kinds(world, daemon, count):

@@ -1,6 +1,5 @@
 """Faults of the outside: mounts that fail, programs that are missing, a full /tmp, busy disks."""
 
-import signal
 import subprocess
 
 import pytest
@@ -55,9 +54,10 @@ def test_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next_p
     assert tried.count("exec cmd = mount > /tmp/mount.txt") == LOOKS
     daemon.wait_log("mount OK, /dev/sda1 ==> /tmp/mountd/disk1_part1", 30)
     first, second = mount_calls(world)
-    assert 18 <= second - first < 28
+    # Nine looks 2 s apart and a cycle; the next pass but one would be 36 s away.
+    assert 18 <= second - first < 36
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
-    world.wait(lambda: world.parts()["sda1"].free_size > 1000, 20, "its free space in disk.json")
+    world.wait(lambda: world.parts()["sda1"].free_size > 1000, 30, "its free space in disk.json")
     assert len(world.db_rows()) == 1
 
 
@@ -78,6 +78,7 @@ def test_damaged_filesystem_is_mounted_once_it_is_repaired(world, start_daemon):
     assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_mount_that_never_appears_holds_up_neither_the_other_disk_nor_the_events(
         world, start_daemon):
@@ -142,7 +143,7 @@ def test_node_that_vanishes_between_event_and_mount_is_survived(world, daemon):
     world.hotplug(doomed, "sda")
     daemon.wait_log("=== ===> dev is already add! dev name = sda1")
     messages = world.pull(doomed, surprise=False)
-    world.wait(lambda: "exec cmd = mount -t ext4 -o rw,defaults /dev/sda1" in daemon.log(), 20,
+    world.wait(lambda: "exec cmd = mount -t ext4 -o rw,defaults /dev/sda1" in daemon.log(), 30,
                "the mount of a device without a node")
     world.send(*messages)
     world.hotplug(other, "sdb")
@@ -156,14 +157,13 @@ def test_node_that_vanishes_between_event_and_mount_is_survived(world, daemon):
 def test_node_that_is_gone_before_its_event_is_read_adds_nothing(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1200))
     world.plug(disk, "sda")
-    daemon.signal(signal.SIGSTOP)
-    world.announce(disk)
-    world.pull(disk, surprise=False)
-    daemon.signal(signal.SIGCONT)
+    with daemon.held_still():
+        world.announce(disk)
+        world.pull(disk, surprise=False)
     daemon.wait_log("=== ===> dev err, dev = /dev/sda1")
     daemon.wait_idle_cycles(1)
     assert "dev ok" not in daemon.log()
-    world.wait(lambda: world.disk_num() == "0", 10, "an empty inventory")
+    world.wait(lambda: world.disk_num() == "0", 30, "an empty inventory")
 
 
 @pytest.mark.needs_fs("ext4")
@@ -212,7 +212,7 @@ def test_tmp_that_fills_up_empties_disk_json_and_the_next_publication_restores_i
     mark = daemon.mark()
     # Truncating its old text would make the room for the new one.
     world.sh(f"rm /tmp/tarn_nas/disk.json; cat /dev/zero >> {FILLER}", check=False)
-    world.wait(lambda: world.exists(DISK_JSON), 20, "an attempt to publish")
+    world.wait(lambda: world.exists(DISK_JSON), 30, "an attempt to publish")
     daemon.wait_idle_cycles(1)
     assert world.disk_json() is None
     assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
@@ -224,6 +224,7 @@ def test_tmp_that_fills_up_empties_disk_json_and_the_next_publication_restores_i
     assert world.disk_num() == "1"
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_services_back(
         world, start_daemon):
@@ -237,7 +238,7 @@ def test_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_serv
     mark = daemon.mark()
     world.send("#remove_dev:sda1", pipe="remove")
     daemon.wait_log("clear ok, find dev = sda1", 40, since=mark)
-    world.wait(lambda: len(world.tools.service_calls()) == 8, 20, "the services' restart")
+    world.wait(lambda: len(world.tools.service_calls()) == 8, 30, "the services' restart")
 
     log = daemon.log_since(mark)
     assert log.count("exec cmd = umount /dev/sda1\n") == 1
@@ -248,7 +249,7 @@ def test_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_serv
     assert world.mounted()["/dev/sda1"] == "/tmp/mountd/disk1_part1"
     rows = {row["dev_name"]: row["mountd"] for row in world.db_rows()}
     assert rows == {"sda1": "no", "sda2": "yes"}
-    world.wait(lambda: set(world.parts()) == {"sda2"}, 20, "sda2 alone in disk.json")
+    world.wait(lambda: set(world.parts()) == {"sda2"}, 30, "sda2 alone in disk.json")
     daemon.wait_rescan()
     assert daemon.running
 
@@ -264,9 +265,9 @@ def test_partition_that_becomes_free_during_the_further_unmounts_is_unmounted(
     assert holder.stdout.readline() == b"inside\n"
     mark = daemon.mark()
     world.send("#remove_dev:sda1")
-    world.wait(lambda: daemon.log_since(mark).count("exec cmd = umount ") >= 3, 20,
+    world.wait(lambda: daemon.log_since(mark).count("exec cmd = umount ") >= 3, 30,
                "the first further try")
     holder.communicate(timeout=10)
-    daemon.wait_log("clear ok, find dev = sda1", 20, since=mark)
+    daemon.wait_log("clear ok, find dev = sda1", 30, since=mark)
     assert world.mounted() == {}
     assert daemon.log_since(mark).count("exec cmd = umount ") < 2 + FURTHER_UMOUNTS

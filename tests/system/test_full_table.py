@@ -92,6 +92,7 @@ def wait_republished(world, daemon):
     world.wait(world.disk_json, 90, "a new disk.json")
 
 
+@pytest.mark.takes_minutes
 def test_full_table_refuses_a_ninth_partition_and_a_seventeenth_disk_and_stays_as_it_is(
         world, start_daemon):
     paper = PaperDisks(world)
@@ -132,6 +133,7 @@ def test_full_table_refuses_a_ninth_partition_and_a_seventeenth_disk_and_stays_a
     assert daemon.running
 
 
+@pytest.mark.takes_minutes
 def test_full_rescan_list_that_shrinks_offers_an_empty_name_which_harms_nothing(
         world, start_daemon):
     paper = PaperDisks(world)
@@ -174,6 +176,7 @@ def test_names_longer_than_a_rescan_slot_are_cut_and_harm_nothing(world, start_d
     assert world.disk_num() == "1"
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_sixteen_mounts_are_seen_and_a_seventeenth_is_made_but_not_seen(world, start_daemon):
     disks = [world.partitioned_disk(*(Partition("ext4", 1000) for _ in range(MAX_PARTS)))

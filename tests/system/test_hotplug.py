@@ -77,7 +77,7 @@ def test_a_number_under_which_something_is_mounted_is_not_given(world, start_dae
     world.run("mkdir", "-p", "/tmp/mountd/disk2_part1")
     world.run("mount", "/dev/sdx1", "/tmp/mountd/disk2_part1")
     world.hotplug(late, "sdb")
-    world.wait(lambda: directories(world).get("sdb1"), 20, "sdb1 in disk.json")
+    world.wait(lambda: directories(world).get("sdb1"), 30, "sdb1 in disk.json")
     assert directories(world)["sdb1"] == "disk3_part1"
 
 
@@ -132,7 +132,7 @@ def test_rescans_alone_find_arrivals_and_departures(world, start_daemon):
     quiet_moment(world, daemon)
     world.pull(comes)
     wait_mounted(world, {"sda1": "disk1_part1"})
-    world.wait(lambda: world.disk_num() == "1", 10, "1 in disk_num.txt")
+    world.wait(lambda: world.disk_num() == "1", 30, "1 in disk_num.txt")
     log = daemon.log()
     assert "EVENT_DISK_ADD" not in log and "EVENT_DISK_REMOVE" not in log
     assert log.index("remove disk, root dev = sdb") < log.index("==> umount dev = sdb1")

@@ -24,13 +24,15 @@ def restart_notes(world):
     return world.read(RESTART_NOTE).splitlines() if world.exists(RESTART_NOTE) else []
 
 
+@pytest.mark.takes_minutes
 def test_silence_with_the_companion_only_warns_and_starts_the_count_again(world, start_daemon):
     world.start_companion()
     daemon = start_daemon()
     line = daemon.wait_log("sys timeout, ", 100)
     elapsed, limit = line.split("sys timeout, ")[1].split(" > ")
     assert limit == "60"
-    assert 61 <= int(elapsed) <= 65
+    # One cycle behind the limit, or the next where a command held the first up.
+    assert 61 <= int(elapsed) <= 70
     daemon.wait_log("get app = tarn_nas_sys, pid = ")
     daemon.wait_idle_cycles(3)
     assert daemon.log().count("sys timeout, ") == 1
@@ -38,6 +40,7 @@ def test_silence_with_the_companion_only_warns_and_starts_the_count_again(world,
     daemon.wait_log("===> get event = EVENT_DISK_HEART_BEAT")
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_silence_without_the_companion_ends_the_daemon_with_0_and_keeps_mounts_and_memory(
         world, start_daemon):
@@ -57,6 +60,7 @@ def test_silence_without_the_companion_ends_the_daemon_with_0_and_keeps_mounts_a
     assert restart_notes(world) == []
 
 
+@pytest.mark.takes_minutes
 def test_companion_that_ends_during_the_silence_does_not_keep_the_daemon(world, start_daemon):
     companion = world.start_companion()
     daemon = start_daemon()
@@ -66,6 +70,7 @@ def test_companion_that_ends_during_the_silence_does_not_keep_the_daemon(world, 
     assert daemon.log().count("sys timeout, ") == 1
 
 
+@pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
 def test_safe_removal_makes_the_silence_limit_five_times_as_long(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
@@ -81,6 +86,7 @@ def test_safe_removal_makes_the_silence_limit_five_times_as_long(world, start_da
     daemon.wait_log("===> get event = EVENT_DISK_HEART_BEAT")
 
 
+@pytest.mark.takes_minutes
 def test_each_heart_beat_starts_the_silence_anew(world, start_daemon):
     daemon = start_daemon()
     started = time.monotonic()
@@ -91,6 +97,7 @@ def test_each_heart_beat_starts_the_silence_anew(world, start_daemon):
     assert daemon.running
 
 
+@pytest.mark.takes_minutes
 def test_bad_messages_do_not_count_as_events_against_the_silence(world, start_daemon):
     daemon = start_daemon()
     started = time.monotonic()
@@ -109,7 +116,7 @@ def start_noting_daemon(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     daemon = start_daemon()
     daemon.wait_log("mount OK, /dev/sda ==> /tmp/mountd/disk1_part1")
-    world.wait(world.db_rows, 10, "the remembered directory")
+    world.wait(world.db_rows, 30, "the remembered directory")
     return daemon
 
 
@@ -124,7 +131,7 @@ def mount_second_device(world, path):
 def assert_ended_for_restart(world, daemon):
     assert daemon.wait_exit(40) == 0
     assert "manager work again!" in daemon.log()
-    world.wait(lambda: restart_notes(world), 10, "the restart command")
+    world.wait(lambda: restart_notes(world), 30, "the restart command")
     assert restart_notes(world) == ["restart pid absent db absent"]
     assert "exec cmd = /etc/init.d/tarn_nas_diskmanager restart &" in daemon.log()
 
@@ -189,7 +196,7 @@ def test_restart_starts_an_instance_that_mounts_everything_again(world, start_da
     assert world.read(PID_FILE) not in ("", str(first_pid))
     assert "===> pid Not exist" in world.read(SECOND_LOG)
     world.send("#heart_beat")
-    world.wait(lambda: "EVENT_DISK_HEART_BEAT" in world.read(SECOND_LOG), 20,
+    world.wait(lambda: "EVENT_DISK_HEART_BEAT" in world.read(SECOND_LOG), 30,
                "an event served by the second instance")
 
 

@@ -21,7 +21,7 @@ def uuid_of(world, dev_name):
 
 
 def wait_rows(world, *rows):
-    world.wait(lambda: world.db_rows() == list(rows), 20,
+    world.wait(lambda: world.db_rows() == list(rows), 30,
                lambda: f"rows {list(rows)}, where {world.db_rows()} are")
 
 

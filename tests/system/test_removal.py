@@ -41,7 +41,7 @@ def hold(world, path):
     """A process that keeps a mount busy; returns its Popen."""
     process = world.popen("/bin/sh", "-c",
                           f"echo $$ > /run/server.pid; cd {path} && exec sleep 600")
-    world.wait(lambda: world.run("pgrep", "-x", "sleep", check=False).stdout, 10, "the sleeper")
+    world.wait(lambda: world.run("pgrep", "-x", "sleep", check=False).stdout, 30, "the sleeper")
     return process
 
 
@@ -58,7 +58,7 @@ def test_a_mounted_partition_is_removed_while_the_services_that_use_it_are_stopp
     mark = daemon.mark()
     world.send("#remove_dev:sda1", pipe="remove")
     wait_directories(world, {"sda2": "disk1_part2"})
-    server.wait(10)
+    server.wait(30)
     assert world.mounted() == {}
     assert calls(world) == STOPPED + STARTED
     ran = [command for command in commands(daemon.log_since(mark))
@@ -76,7 +76,7 @@ def test_services_are_stopped_and_started_for_an_unknown_name_too(world, start_d
     daemon = start_daemon()
     wait_mounted(world, {"sda1": "disk1_part1"})
     world.send(message)
-    world.wait(lambda: calls(world) == STOPPED + STARTED, 15, "the services' calls")
+    world.wait(lambda: calls(world) == STOPPED + STARTED, 30, "the services' calls")
     daemon.wait_log("no event ...", since=daemon.mark())
     wait_mounted(world, {"sda1": "disk1_part1"})
     assert "umount" not in "".join(commands(daemon.log()))
@@ -121,7 +121,7 @@ def test_a_directory_name_removes_its_partition_and_the_last_one_its_disk(world,
 
     world.send("#remove_disk:disk1_part2", pipe="remove")
     wait_directories(world, {"sdb": "disk2_part1"})
-    world.wait(lambda: world.disk_num() == "1", 10, "1 in disk_num.txt")
+    world.wait(lambda: world.disk_num() == "1", 30, "1 in disk_num.txt")
     assert daemon.running
 
 
@@ -154,7 +154,7 @@ def test_after_a_safe_removal_the_daemon_rests_and_only_announced_disks_return(
     first_rescan_over(world, daemon)
 
     world.safe_remove()
-    world.wait(lambda: world.parts() == {} and world.disk_num() == "0", 20,
+    world.wait(lambda: world.parts() == {} and world.disk_num() == "0", 30,
                "a status without disks")
     assert world.mounted() == {}
     assert calls(world) == STOPPED + STARTED
@@ -183,7 +183,7 @@ def test_a_disk_pulled_while_mounted_is_unmounted_and_forgotten(world, start_dae
     quiet_moment(world, daemon)
     world.hotunplug(disk)
     wait_mounted(world, {})
-    world.wait(lambda: world.disk_num() == "0", 20, "0 in disk_num.txt")
+    world.wait(lambda: world.disk_num() == "0", 30, "0 in disk_num.txt")
 
     assert mountd_flags(world) == {"sda1": "no", "sda2": "no"}
     daemon.wait_log("want remove dev(sda) not exist!")

@@ -29,7 +29,8 @@ def test_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cyc
     mark = daemon.mark()
     daemon.signal(signal.SIGINT)
     daemon.wait_log("get sig = SIGINT, c = 1", since=mark)
-    assert daemon.wait_exit(6) == 0
+    assert daemon.wait_exit() == 0
+    assert daemon.log_since(mark).count("no event ...") <= 1
     assert daemon.log().count("manager work again!") == 1
     assert daemon.log().count("get sig = ") == 2
     assert not world.exists(PID_FILE)
@@ -39,7 +40,7 @@ def test_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cyc
 def test_end_by_sigint_leaves_mounts_status_files_and_pipes_in_place(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     daemon = start_daemon()
-    world.wait(lambda: "sda" in world.parts(), 20, "sda in disk.json")
+    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
     published = world.read(DISK_JSON)
 
     assert daemon.stop() == 0
@@ -66,10 +67,10 @@ def test_other_signals_are_only_logged_with_their_number_and_sigpipe_by_name(wor
     for number in (signal.SIGUSR1, signal.SIGALRM, signal.SIGHUP, signal.SIGCHLD):
         mark = daemon.mark()
         daemon.signal(number)
-        line = daemon.wait_log(f"*** *** get sig = {int(number)}", 10, since=mark)
+        line = daemon.wait_log(f"*** *** get sig = {int(number)}", 30, since=mark)
         assert re.fullmatch(r"Warning\[signals\.cpp:\d+\]\*\*\* \*\*\* get sig = \d+", line)
     daemon.signal(signal.SIGPIPE)
-    line = daemon.wait_log("get sig = SIGPIPE", 10)
+    line = daemon.wait_log("get sig = SIGPIPE", 30)
     assert re.fullmatch(r"signals\.cpp\(\d+\)get sig = SIGPIPE", line)
 
     world.send("#heart_beat")
@@ -80,7 +81,7 @@ def test_other_signals_are_only_logged_with_their_number_and_sigpipe_by_name(wor
 
 def test_commands_of_the_daemon_give_no_child_signal_lines(world, daemon):
     world.send("#remove_dev:sdx")
-    world.wait(lambda: len(world.tools.service_calls()) == 8, 20, "the services' restart")
+    world.wait(lambda: len(world.tools.service_calls()) == 8, 30, "the services' restart")
     daemon.wait_idle_cycles(1)
     assert "get sig = " not in daemon.log()
 
@@ -97,7 +98,7 @@ def test_after_sigusr2_every_message_also_reaches_syslog_as_info_of_tarndisk(wor
     assert syslog.messages() == []
 
     daemon.signal(signal.SIGUSR2)
-    syslog.wait_message("no event ...", timeout=10)
+    syslog.wait_message("no event ...", timeout=30)
     world.send("#heart_beat", "#nonsense", "#add", "#remove_dev:sdx")
     syslog.wait_message("want remove dev(sdx) not exist!")
     world.send("#heart_beat:last")
@@ -118,11 +119,11 @@ def test_after_sigusr2_every_message_also_reaches_syslog_as_info_of_tarndisk(wor
 def test_a_second_sigusr2_does_not_switch_the_syslog_copy_off(world, daemon):
     syslog = world.syslog()
     daemon.signal(signal.SIGUSR2)
-    syslog.wait_message("no event ...", timeout=10)
+    syslog.wait_message("no event ...", timeout=30)
     daemon.signal(signal.SIGUSR2)
     daemon.wait_idle_cycles(1)
     world.send("#heart_beat")
-    syslog.wait_message("===> get event = EVENT_DISK_HEART_BEAT", timeout=10)
+    syslog.wait_message("===> get event = EVENT_DISK_HEART_BEAT", timeout=30)
 
 
 def test_sigusr2_without_a_syslog_is_survived(world, daemon):
@@ -168,13 +169,13 @@ def test_reader_of_the_output_that_goes_away_neither_ends_the_daemon_nor_makes_i
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
     # The next message is read when the cycle with the first rescan and its check is over.
     world.send("#heart_beat")
-    world.wait(lambda: unread_bytes(world) == 0, 20, "the end of the cycle")
+    world.wait(lambda: unread_bytes(world) == 0, 30, "the end of the cycle")
     world.hotunplug(disk)
     world.wait(lambda: world.disk_num() == "0", 30, "an empty inventory")
 
     # Idle, its part is a few hundred short writes; a loop would use whole seconds.
     spent, started = cpu_seconds(daemon), time.monotonic()
-    world.wait(lambda: time.monotonic() - started > 7, 10, "two idle cycles")
+    world.wait(lambda: time.monotonic() - started > 7, 30, "two idle cycles")
     assert cpu_seconds(daemon) - spent < 1
     for _ in range(2):
         daemon.signal(signal.SIGUSR1)

@@ -55,7 +55,7 @@ def test_plugged_disk_is_mounted_published_and_remembered(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1200, "DATA"), Partition("ntfs", 500))
     world.hotplug(disk, "sda")
     daemon.wait_log("mount OK, /dev/sda1 ==> /tmp/mountd/disk1_part1")
-    world.wait(lambda: "sda1" in world.parts(), 15, "sda1 in disk.json")
+    world.wait(lambda: "sda1" in world.parts(), 30, "sda1 in disk.json")
 
     part = world.parts()["sda1"]
     assert (part.disk_name, part.fs_type, part.label) == ("disk1_part1", "EXT4", "DATA")

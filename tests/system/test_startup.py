@@ -60,7 +60,7 @@ def test_clean_start_without_disks_prepares_everything_and_publishes_the_empty_d
     assert world.path("/tmp/mountd").is_dir()
     assert world.path("/etc/config/tarn_nas").is_dir()
     assert not world.exists(HOOK)
-    world.wait(lambda: world.exists("/tmp/tarn_nas/disk.json"), 5, "disk.json")
+    world.wait(lambda: world.exists("/tmp/tarn_nas/disk.json"), 30, "disk.json")
     assert world.read("/tmp/tarn_nas/disk.json") == EMPTY_DOCUMENT
     assert not world.exists("/tmp/tarn_nas/disk_num.txt")
 
@@ -88,7 +88,7 @@ def test_without_disks_no_rescan_runs_until_an_add_event(world, daemon):
     assert world.read("/tmp/tarn_nas/disk.json") == EMPTY_DOCUMENT
 
     world.send("#add:sda")
-    world.wait(lambda: "sda" in world.parts(), 20, "sda in disk.json")
+    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
 
 
 def test_second_instance_ends_with_1_and_leaves_the_first_alone(world, daemon):
@@ -115,7 +115,7 @@ def test_pid_file_with_a_single_digit_counts_as_live_when_a_listed_pid_holds_the
     # Pids are small in a world of its own: twenty in a row hold one with a 1.
     bystanders = [world.popen("/bin/sh", "-c", "sleep 30; : tarn_nas_diskmanager")
                   for _ in range(20)]
-    world.wait(lambda: "1" in world.run("pgrep", "-f", "tarn_nas_diskmanager").stdout, 10,
+    world.wait(lambda: "1" in world.run("pgrep", "-f", "tarn_nas_diskmanager").stdout, 30,
                "a pid with a 1 in it")
     world.write(PID_FILE, "1")
     done = run_program(world, timeout=20)
@@ -165,7 +165,7 @@ def test_block_input_run_takes_over_what_is_mounted_already(world, start_daemon)
     world.run("mount", "/dev/sda", "/tmp/mountd/disk7_part3")
     daemon = start_daemon("-e")
     daemon.wait_log("already mounted, dev = /dev/sda")
-    world.wait(lambda: "sda" in world.parts(), 20, "sda in disk.json")
+    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
 
     assert "disk manage run block input" in daemon.log()
     assert world.parts()["sda"].disk_name == "disk7_part3"

@@ -86,6 +86,7 @@ class Daemon:
         which restarts the daemon. That moment comes every eight seconds and would hit a test now and then.
         """
         self._signal_listening("STOP")
+        self.vm.wait(f"grep -q '^State:.T' /proc/$(cat {PID_FILE})/status")
         removed = self._removed_disks()
         yield
         self.vm.wait(f"[ $(grep -c '{REMOVED_DISK}' /tmp/uevents) -gt {removed} ]")

@@ -27,7 +27,7 @@ class Daemon:
         self.process = process
         self.log_path = Path(log_path)
         self.outer_pid = 0
-        wait_for(self._find_process, 10, "the daemon's process")
+        wait_for(self._find_process, 30, "the daemon's process")
 
     @property
     def running(self):
@@ -78,7 +78,7 @@ class Daemon:
             return None
         return wait_for(look, timeout, lambda: f"{text!r} in the log; {self._tail()}")
 
-    def wait_started(self, timeout=20):
+    def wait_started(self, timeout=60):
         """Wait until its signal handlers are in place and the first scan is done."""
         return self.wait_log(STARTED, timeout)
 
@@ -118,6 +118,29 @@ class Daemon:
             with contextlib.suppress(ProcessLookupError):
                 os.kill(self.outer_pid, number)
 
+    @contextlib.contextmanager
+    def held_still(self):
+        """Stop the process in its wait for events for as long as the `with` block lasts.
+
+        A signal is sent and not yet taken when kill returns: what is done in the block
+        must not be seen by a daemon that still runs.
+        """
+        wait_for(self.waits_for_events, 60, lambda: f"its wait for events; {self._tail()}", 0.01)
+        self.signal(signal.SIGSTOP)
+        wait_for(lambda: _state(self.outer_pid) == "T", 30, "the daemon to stop", 0.01)
+        try:
+            yield
+        finally:
+            self.signal(signal.SIGCONT)
+
+    def waits_for_events(self):
+        """True while it does nothing but wait for a message."""
+        try:
+            place = Path(f"/proc/{self.outer_pid}/wchan").read_text()
+        except OSError:
+            return False
+        return "select" in place or "poll" in place
+
     def stop(self, timeout=60):
         """Two SIGINTs and the end; returns the exit status.
 
@@ -136,7 +159,7 @@ class Daemon:
     def kill(self):
         """End it without a chance to tidy up."""
         self.signal(signal.SIGKILL)
-        return self.wait_exit(10)
+        return self.wait_exit(30)
 
     def rss_kib(self):
         return self._rollup("Rss:")
@@ -186,6 +209,11 @@ class Daemon:
 
     def _tail(self):
         return f"the log ends:\n{self.log()[-GONE_TAIL:]}"
+
+
+def _state(pid):
+    """The letter that the kernel gives a process's state."""
+    return Path(f"/proc/{pid}/stat").read_text().rsplit(")", 1)[1].split()[0]
 
 
 def child_of(pid):

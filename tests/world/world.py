@@ -179,13 +179,13 @@ class World(state.Observed):
         process = self.popen(self.tools.companion_program(), "infinity",
                              stdin=subprocess.DEVNULL)
         self._processes.append(process)
-        wait_for(self._companion_runs, 10, "the companion process")
+        wait_for(self._companion_runs, 30, "the companion process")
         return process
 
     def stop_companion(self, process):
         """End a process of `start_companion`; `pidof` no longer finds it."""
         self._kill_group(process)
-        wait_for(lambda: not self._companion_runs(), 10, "the companion's end")
+        wait_for(lambda: not self._companion_runs(), 30, "the companion's end")
 
     def _companion_runs(self):
         return self.run("pidof", COMPANION, check=False).stdout.strip()
@@ -265,7 +265,7 @@ class World(state.Observed):
         """Send the add messages of a plugged disk."""
         self.send(*add_messages(disk))
 
-    def send(self, *messages, pipe="add_remove", timeout=15):
+    def send(self, *messages, pipe="add_remove", timeout=30):
         """Write messages into a pipe, a line each, whole or not at all.
 
         `pipe` is "add_remove", "safe_remove" or "remove"; a missing reader is a
@@ -274,7 +274,7 @@ class World(state.Observed):
         for message in messages:
             self.send_bytes(message.encode() + b"\n", pipe, timeout)
 
-    def send_bytes(self, data, pipe="add_remove", timeout=15):
+    def send_bytes(self, data, pipe="add_remove", timeout=30):
         """Write bytes into a pipe as they stand."""
         write_pipe(self.path(PIPES[pipe]), data, timeout)
 
@@ -357,10 +357,10 @@ class World(state.Observed):
             with contextlib.suppress(OSError):
                 stream.close()
         try:
-            self._keeper.wait(10)
+            self._keeper.wait(30)
         except subprocess.TimeoutExpired:
             self._keeper.kill()
-            self._keeper.wait(10)
+            self._keeper.wait(30)
 
     def _furnish(self):
         """What a router has at boot and the daemon expects."""
@@ -381,7 +381,7 @@ class World(state.Observed):
         # The group holds nsenter and what it started, inside and outside alike.
         with contextlib.suppress(ProcessLookupError):
             os.killpg(process.pid, 9)
-        process.wait(10)
+        process.wait(30)
 
     def _release_disks(self):
         for disk in self._disks:
@@ -396,4 +396,4 @@ class World(state.Observed):
 
         def still():
             return [loop.path for loop in loops if loop.is_attached()]
-        wait_for(lambda: not still(), 10, lambda: f"the kernel to detach {still()}")
+        wait_for(lambda: not still(), 30, lambda: f"the kernel to detach {still()}")
