@@ -55,13 +55,23 @@ def start_without(starts):
     return starts.world.start_daemon(environ=starts.environ)
 
 
-def test_full_tmp_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
-    fill(rig.world, "/tmp")
+def test_full_tmp_for_a_cycle_loses_nothing_and_the_next_plug_is_right(rig):
+    world, home = rig.world, rig.paths()["/dev/sda1"]
+    world.sh(f"echo kept > {home}/note")
+    fill(world, "/tmp")
     mark = rig.daemon.mark()
-    rig.busy_cycle()
+    rig.plug_cycle()
     assert "dev err, dev = /dev/sdb\n" in rig.daemon.log_since(mark)
-    rig.world.path(f"/tmp/{FILLER}").unlink()
+    assert world.mounted() == {"/dev/sda1": home}
+    # The document that was whole before stays so.
+    assert world.disk_json() is not None
+    # A mount that nobody could look at is neither undone nor made anew.
+    assert "mount ERROR" not in rig.daemon.log_since(mark)
+    assert world.read(f"{home}/note") == "kept\n"
+    rig.safe_removal()
+    world.path(f"/tmp/{FILLER}").unlink()
     rig.check()
+    assert world.read(f"{home}/note") == "kept\n"
 
 
 def test_tmp_without_a_free_inode_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
@@ -140,6 +150,9 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
     daemon = start_without(starts)
     world.wait(starts.is_right, 10, "the disk in disk.json")
     assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
+    assert "sqlite err = unable to open database file" in daemon.log()
+    assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
+    assert not world.exists(DISK_DB)
     assert world.exists(HOOK)
 
     remount(world, "rw", "/etc")
@@ -151,6 +164,29 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
     # The hook of the system's own is the next start's to delete.
     start_without(starts)
     assert not world.exists(HOOK)
+
+
+def test_read_only_database_is_still_read_and_a_remembered_directory_kept(starts):
+    world = starts.world
+    daemon = start_without(starts)
+    world.wait(starts.is_right, 10, "the disk in disk.json")
+    assert daemon.stop() == 0
+    world.db_execute("update disk set disk_name='disk7_part2', mountd='no',"
+                     " mount_path='/tmp/mountd/disk7_part2'")
+    world.plug(world.whole_disk("ext4"), "sdb")
+    remount(world, "ro", "/etc")
+    daemon = start_without(starts)
+    world.wait(lambda: len(world.parts()) == 2, 20, "two disks in disk.json")
+
+    assert "sqlite err = attempt to write a readonly database" in daemon.log()
+    paths = world.mounted()
+    assert paths["/dev/sda1"] == "/tmp/mountd/disk7_part2"
+    assert paths["/dev/sdb"] in ("/tmp/mountd/disk1_part1", "/tmp/mountd/disk2_part1")
+    assert [(row["disk_name"], row["mountd"]) for row in world.db_rows()] == [
+        ("disk7_part2", "no")]
+    world.safe_remove()
+    world.wait(lambda: world.mounted() == {}, 20, "the unmount")
+    assert daemon.stop() == 0
 
 
 def test_full_filesystem_under_the_database_keeps_every_row_and_takes_changes_afterwards(rig):

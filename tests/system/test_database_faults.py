@@ -1,4 +1,4 @@
-"""A damaged, read-only or locked database, and rows that the daemon would not have written."""
+"""A damaged or locked database, and rows that the daemon would not have written."""
 
 import subprocess
 import sys
@@ -96,46 +96,6 @@ def test_damaged_database_is_left_as_it_is(world, start_daemon):
     daemon.wait_log("mount OK, /dev/sda")
     daemon.wait_rescan()
     assert world.path(DISK_DB).read_bytes() == before
-
-
-def make_read_only(world):
-    world.run("mount", "--bind", CONFIG_DIR, CONFIG_DIR)
-    world.run("mount", "-o", "remount,ro,bind", CONFIG_DIR)
-
-
-@pytest.mark.needs_fs("ext4")
-def test_read_only_database_is_still_read_and_a_remembered_directory_kept(world, start_daemon):
-    known, fresh = world.whole_disk("ext4"), world.whole_disk("ext4")
-    world.plug(known, "sda")
-    world.plug(fresh, "sdb")
-    world.db_execute(TABLE)
-    remember(world, uid_of(world, "/dev/sda"), "disk7_part2")
-    make_read_only(world)
-    daemon = start_daemon()
-    world.wait(lambda: len(world.parts()) == 2, 30, "two disks in disk.json")
-
-    assert "sqlite err = attempt to write a readonly database" in daemon.log()
-    paths = world.mounted()
-    assert paths["/dev/sda"] == "/tmp/mountd/disk7_part2"
-    assert paths["/dev/sdb"] in ("/tmp/mountd/disk1_part1", "/tmp/mountd/disk2_part1")
-    assert [(row["disk_name"], row["mountd"]) for row in world.db_rows()] == [
-        ("disk7_part2", "no")]
-    world.safe_remove()
-    world.wait(lambda: world.mounted() == {}, 30, "the unmount")
-    assert daemon.running
-
-
-@pytest.mark.needs_fs("ext4")
-def test_directory_that_takes_no_database_stops_no_mount(world, start_daemon):
-    world.path(CONFIG_DIR).mkdir(parents=True)
-    make_read_only(world)
-    world.plug(world.whole_disk("ext4"), "sda")
-    daemon = start_daemon()
-    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
-    assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
-    assert "sqlite err = unable to open database file" in daemon.log()
-    assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
-    assert not world.exists(DISK_DB)
 
 
 @pytest.mark.needs_fs("ext4")

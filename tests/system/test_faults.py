@@ -1,17 +1,14 @@
-"""Faults of the outside: mounts that fail, programs that are missing, a full /tmp, busy disks."""
+"""Faults of the outside: mounts that fail, programs that are missing, busy disks."""
 
 import subprocess
 
 import pytest
-from shared.moments import quiet_moment
 
 from world import Partition
-from world.state import DISK_JSON
 
 LOOKS = 9
 FURTHER_UMOUNTS = 10
 CALLS = "/run/world/mount-calls.txt"
-FILLER = "/tmp/filler"
 
 
 def stub_mount(world, pattern, failures):
@@ -164,64 +161,6 @@ def test_node_that_is_gone_before_its_event_is_read_adds_nothing(world, daemon):
     daemon.wait_idle_cycles(1)
     assert "dev ok" not in daemon.log()
     world.wait(lambda: world.disk_num() == "0", 30, "an empty inventory")
-
-
-@pytest.mark.needs_fs("ext4")
-def test_full_tmp_loses_nothing_and_the_status_files_are_valid_again_once_there_is_room(
-        make_world):
-    world = make_world(tmp_mib=2)
-    kept, pulled, late = (world.partitioned_disk(Partition("ext4", 1100)) for _ in range(3))
-    world.plug(kept, "sda")
-    world.plug(pulled, "sdb")
-    daemon = world.start_daemon()
-    world.wait(lambda: len(world.parts()) == 2, 30, "two partitions in disk.json")
-    daemon.wait_rescan()
-    quiet_moment(world, daemon)
-    paths = world.mounted()
-    world.sh(f"echo kept > {paths['/dev/sda1']}/file")
-
-    world.sh(f"cat /dev/zero > {FILLER}", check=False)
-    world.hotunplug(pulled)
-    world.hotplug(late, "sdc")
-    daemon.wait_log("=== ===> dev err, dev = /dev/sdc1", 40)
-    daemon.wait_idle_cycles(4)
-    assert world.mounted() == {"/dev/sda1": paths["/dev/sda1"]}
-    assert world.disk_json() is None or "sdb1" not in world.parts()
-    assert world.read(f"{paths['/dev/sda1']}/file") == "kept\n"
-
-    world.path(FILLER).unlink()
-    world.announce(late)
-    world.wait(lambda: set(world.parts()) == {"sda1", "sdc1"}, 40, "both partitions in disk.json")
-    assert world.disk_num() == "2"
-    assert world.parts()["sda1"].path == paths["/dev/sda1"]
-    # The number of the disk that went is the lowest that is free.
-    assert world.mounted() == {"/dev/sda1": paths["/dev/sda1"], "/dev/sdc1": paths["/dev/sdb1"]}
-    assert world.read(f"{paths['/dev/sda1']}/file") == "kept\n"
-    assert daemon.running
-
-
-@pytest.mark.needs_fs("ext4")
-def test_tmp_that_fills_up_empties_disk_json_and_the_next_publication_restores_it(make_world):
-    world = make_world(tmp_mib=2)
-    world.plug(world.whole_disk("ext4"), "sda")
-    daemon = world.start_daemon()
-    world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
-    published = world.disk_json()
-    daemon.wait_rescan()
-    world.sh(f"cat /dev/zero > {FILLER}", check=False)
-    mark = daemon.mark()
-    # Truncating its old text would make the room for the new one.
-    world.sh(f"rm /tmp/tarn_nas/disk.json; cat /dev/zero >> {FILLER}", check=False)
-    world.wait(lambda: world.exists(DISK_JSON), 30, "an attempt to publish")
-    daemon.wait_idle_cycles(1)
-    assert world.disk_json() is None
-    assert world.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
-    assert "mount ERROR" not in daemon.log_since(mark)
-
-    world.path(FILLER).unlink()
-    world.send("#add:sda")
-    world.wait(lambda: world.disk_json() == published, 40, "the document as it was")
-    assert world.disk_num() == "1"
 
 
 @pytest.mark.takes_minutes
