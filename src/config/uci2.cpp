@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "log/log.h"
 #include "util/guard.h"
 #include "util/text.h"
 
@@ -14,6 +15,11 @@ constexpr size_t UCI_PATH_SIZE = 128;
 constexpr size_t SPLIT_SIZE = 100;
 constexpr char SECTION_DELIMITERS[] = ".@";
 constexpr char OPTION_DELIMITERS[] = ".";
+constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
+                                   "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
+                                   "0123456789_";
+
+using context_guard = guard<uci_context*, nullptr, uci_free_context>;
 
 // A private copy of a path: the library writes into the text that it parses, and its look-up result
 // points into it.
@@ -95,38 +101,106 @@ const char* value_text(const uci_ptr& ptr)
     }
 }
 
-void index_path(char (&out)[UCI_PATH_SIZE], const char* type, int index, const char* option)
+// What the library would not survive, or could not read again once it is written.
+bool refuse(const char* reason, const char* path)
 {
+    log_err("uci %s, path = %s\n", reason, path != nullptr ? path : "");
+    return false;
+}
+
+// One character more than a path may have, so that one which is too long shows.
+using built_path = char[UCI_PATH_SIZE + 1];
+
+// A path that was cut would name another option.
+bool is_whole(const built_path& path)
+{
+    return strlen(path) < UCI_PATH_SIZE || refuse("path too long", path);
+}
+
+bool index_path(built_path& out, const char* type, int index, const char* option)
+{
+    if (type == nullptr) {
+        return refuse("type missing", option);
+    }
     if (option != nullptr) {
         text_format(out, "%s[%d].%s", type, index, option);
     } else {
         text_format(out, "%s[%d]", type, index);
     }
+    return is_whole(out);
 }
 
-void name_path(char (&out)[UCI_PATH_SIZE], const char* package, const char* section,
-               const char* option)
+bool name_path(built_path& out, const char* package, const char* section, const char* option)
 {
+    if (package == nullptr || section == nullptr) {
+        return refuse("name missing", option);
+    }
     if (option != nullptr) {
         text_format(out, "%s.%s.%s", package, section, option);
     } else {
         text_format(out, "%s.%s", package, section);
     }
+    return is_whole(out);
 }
 
-int change(uci_context* ctx, const path_copy& path, int (*call)(uci_context*, uci_ptr*))
+bool is_name(const char* text)
 {
-    uci_ptr ptr;
-    return look_up(ctx, path, &ptr) && call(ctx, &ptr) == UCI_OK ? 0 : -1;
+    return text[0] != '\0' && text[strspn(text, NAME_CHARACTERS)] == '\0';
 }
 
-int change_and_save(uci_context* ctx, const path_copy& path, int (*call)(uci_context*, uci_ptr*))
+// The library takes more for a type, and writes it without quotes.
+bool is_type(const char* text)
 {
-    uci_ptr ptr;
-    if (!look_up(ctx, path, &ptr) || call(ctx, &ptr) != UCI_OK) {
-        return -1;
+    for (const char* c = text; *c != '\0'; ++c) {
+        if (*c <= ' ' || *c > '~' || strchr("'\"\\#;", *c) != nullptr) {
+            return false;
+        }
     }
-    return uci_save(ctx, ptr.p) == UCI_OK ? 0 : -1;
+    return text[0] != '\0';
+}
+
+using library_call = int (*)(uci_context*, uci_ptr*);
+
+// May the call be made of what the path was found to name? The library itself asks less.
+bool is_sound(library_call call, const uci_ptr& ptr, const char* path)
+{
+    if (call == uci_rename) {
+        return is_name(ptr.value) || refuse("name not valid", path);
+    }
+    if ((call == uci_add_list || call == uci_del_list) && ptr.option == nullptr) {
+        return refuse("option missing", path);
+    }
+    if (call != uci_set || ptr.option != nullptr || ptr.section == nullptr) {
+        return true;
+    }
+    // A section is set: its value is its type, and one that is not there yet gets its name from the
+    // path. An empty value deletes.
+    if (ptr.value[0] != '\0' && !is_type(ptr.value)) {
+        return refuse("type not valid", path);
+    }
+    return ptr.s != nullptr || is_name(ptr.section) || refuse("name not valid", path);
+}
+
+// Looks the path up and makes the call. A path with a "=" would end there for the library.
+bool change(uci_context* ctx, uci_ptr* ptr, const char* path, const path_copy& copy,
+            library_call call)
+{
+    if (path != nullptr && strchr(path, '=') != nullptr) {
+        return refuse("path not valid", path);
+    }
+    return look_up(ctx, copy, ptr) && is_sound(call, *ptr, path) && call(ctx, ptr) == UCI_OK;
+}
+
+int change_unsaved(uci_context* ctx, const char* path, const char* value, library_call call)
+{
+    uci_ptr ptr;
+    return change(ctx, &ptr, path, path_copy(path, value), call) ? 0 : -1;
+}
+
+int change_and_save(uci_context* ctx, const char* path, const path_copy& copy, library_call call)
+{
+    uci_ptr ptr;
+    return change(ctx, &ptr, path, copy, call) && uci_save(ctx, ptr.p) == UCI_OK ? 0 : -1;
 }
 
 uci_package* look_up_package(uci_context* ctx, const char* name)
@@ -188,6 +262,9 @@ int uci2_free(uci_context* ctx)
 
 int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
 {
+    if (out == nullptr) {
+        return -1;
+    }
     text_copy({out, size}, "");
     const path_copy copy(path);
     uci_ptr ptr;
@@ -201,58 +278,54 @@ int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
 int uci2_get_by_index(uci_context* ctx, const char* type, int index, const char* option, char* out,
                       size_t size)
 {
-    char path[UCI_PATH_SIZE];
-    index_path(path, type, index, option);
-    return uci2_get(ctx, path, out, size);
+    built_path path;
+    return uci2_get(ctx, index_path(path, type, index, option) ? path : nullptr, out, size);
 }
 
 int uci2_get_by_name(uci_context* ctx, const char* package, const char* section, const char* option,
                      char* out, size_t size)
 {
-    char path[UCI_PATH_SIZE];
-    name_path(path, package, section, option);
-    return uci2_get(ctx, path, out, size);
+    built_path path;
+    return uci2_get(ctx, name_path(path, package, section, option) ? path : nullptr, out, size);
 }
 
 int uci2_set(uci_context* ctx, const char* path, const char* value)
 {
-    return change_and_save(ctx, path_copy(path, value), uci_set);
+    return change_and_save(ctx, path, path_copy(path, value), uci_set);
 }
 
 int uci2_set_by_index(uci_context* ctx, const char* type, int index, const char* option,
                       const char* value)
 {
-    char path[UCI_PATH_SIZE];
-    index_path(path, type, index, option);
-    return uci2_set(ctx, path, value);
+    built_path path;
+    return index_path(path, type, index, option) ? uci2_set(ctx, path, value) : -1;
 }
 
 int uci2_set_by_name(uci_context* ctx, const char* package, const char* section, const char* option,
                      const char* value)
 {
-    char path[UCI_PATH_SIZE];
-    name_path(path, package, section, option);
-    return uci2_set(ctx, path, value);
+    built_path path;
+    return name_path(path, package, section, option) ? uci2_set(ctx, path, value) : -1;
 }
 
 int uci2_rename(uci_context* ctx, const char* path, const char* new_name)
 {
-    return change_and_save(ctx, path_copy(path, new_name), uci_rename);
+    return change_and_save(ctx, path, path_copy(path, new_name), uci_rename);
 }
 
 int uci2_delete(uci_context* ctx, const char* path)
 {
-    return change_and_save(ctx, path_copy(path), uci_delete);
+    return change_and_save(ctx, path, path_copy(path), uci_delete);
 }
 
 int uci2_add_list(uci_context* ctx, const char* path, const char* value)
 {
-    return change(ctx, path_copy(path, value), uci_add_list);
+    return change_unsaved(ctx, path, value, uci_add_list);
 }
 
 int uci2_del_list(uci_context* ctx, const char* path, const char* value)
 {
-    return change(ctx, path_copy(path, value), uci_del_list);
+    return change_unsaved(ctx, path, value, uci_del_list);
 }
 
 int uci2_commit(uci_context* ctx, const char* package)
@@ -267,18 +340,18 @@ int uci2_commit(uci_context* ctx, const char* package)
 
 int uci2_add_section(const char* package, const char* type)
 {
-    uci_context* ctx = uci_alloc_context();
-    if (ctx == nullptr) {
+    if (package == nullptr || type == nullptr || !is_type(type)) {
+        refuse("type not valid", package);
         return -1;
     }
-    int ret = -1;
+    const context_guard ctx(uci_alloc_context());
     uci_package* loaded = nullptr;
-    if (uci_load(ctx, package, &loaded) == UCI_OK) {
-        ret = add_section_to(ctx, loaded_package(ctx, package), type);
-        // The commit has read the package anew.
-        uci_unload(ctx, loaded_package(ctx, package));
+    if (ctx == nullptr || uci_load(ctx, package, &loaded) != UCI_OK) {
+        return -1;
     }
-    uci_free_context(ctx);
+    const int ret = add_section_to(ctx, loaded_package(ctx, package), type);
+    // The commit has read the package anew.
+    uci_unload(ctx, loaded_package(ctx, package));
     return ret;
 }
 
@@ -308,8 +381,10 @@ int uci2_count_type(uci_context* ctx, const char* package_and_type)
 
 uci_section* uci2_get_section(uci_context* ctx, const char* type, int index)
 {
-    char path[UCI_PATH_SIZE];
-    index_path(path, type, index, nullptr);
+    built_path path;
+    if (!index_path(path, type, index, nullptr)) {
+        return nullptr;
+    }
     const path_copy copy(path);
     uci_ptr ptr;
     return look_up_complete(ctx, copy, &ptr) ? ptr.s : nullptr;
@@ -356,7 +431,7 @@ const char* uci2_list_contains(uci_context* ctx, const char* path, const char* v
 
 int uci2_list_item(uci_context* ctx, const char* path, int index, char* out, size_t size)
 {
-    uci_list* list = look_up_list(ctx, path);
+    uci_list* list = out != nullptr ? look_up_list(ctx, path) : nullptr;
     if (list == nullptr) {
         return 0;
     }

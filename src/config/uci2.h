@@ -1,7 +1,11 @@
 // Router configuration by dotted path text ("package.section.option"; "package.@type[index].option"
 // works too). Writes go to the context's change store; uci2_commit and uci2_add_section make them
-// permanent. Results are 0 for success and -1 for failure unless a line says otherwise; nothing is
-// logged, a failed read yields an empty text.
+// permanent. Results are 0 for success and -1 for failure unless a line says otherwise; a failed
+// read yields an empty text.
+//
+// A failure is not logged, but a refusal is: of a missing name or type, a path that is built of
+// parts and longer than 127 characters, a path with "=", a list without an option, a name that is
+// not all letters, digits and "_", a type that could not be read again. Nothing is written then.
 //
 // The value text of an option is its string, of a list its last element; that of a section is its
 // type.

@@ -62,6 +62,15 @@ protected:
         return ret == 0 ? out : "(none)";
     }
 
+    // uci2_commit without the wait for every disk of the machine.
+    [[nodiscard]] bool commit() const
+    {
+        uci_ptr ptr{};
+        char name[] = "firewall";
+        return uci_lookup_ptr(ctx, &ptr, name, true) == UCI_OK &&
+               uci_commit(ctx, &ptr.p, false) == UCI_OK;
+    }
+
     [[nodiscard]] std::string on_disk() const { return support::read_file(file); }
 
     const std::string file = "/etc/config/firewall";
@@ -365,7 +374,208 @@ TEST_F(Uci, CountsTheElementsOfAList)
     EXPECT_EQ(uci2_list_count(ctx, "firewall.webdav_wan.missing"), 0);
 }
 
-TEST_F(Uci, NothingIsLogged)
+// What the library itself would not survive runs in a process of its own.
+TEST_F(Uci, ASectionWithoutPackageOrTypeIsRefused)
+{
+    const std::string log = support::log_of([&] {
+        EXPECT_EQ(support::in_child([] {
+                      EXPECT_EQ(uci2_add_section("firewall", nullptr), -1);
+                      EXPECT_EQ(uci2_add_section(nullptr, "zone"), -1);
+                      EXPECT_EQ(uci2_add_section(nullptr, nullptr), -1);
+                      EXPECT_EQ(uci2_add_section("firewall", ""), -1);
+                      return 0;
+                  }),
+                  0);
+    });
+    EXPECT_EQ(log, "ERROR[uci2.cpp:N]uci type not valid, path = firewall\n"
+                   "ERROR[uci2.cpp:N]uci type not valid, path = \n"
+                   "ERROR[uci2.cpp:N]uci type not valid, path = \n"
+                   "ERROR[uci2.cpp:N]uci type not valid, path = firewall\n");
+    EXPECT_EQ(on_disk(), FIREWALL);
+}
+
+TEST_F(Uci, APathOf127CharactersIsTakenAndALongerOneNeverCut)
+{
+    // The longer path, cut, would be the shorter one.
+    const std::string option(127 - strlen("firewall.webdav_wan."), 'o');
+    const std::string longer = option + "o";
+    ASSERT_EQ(uci2_set(ctx, ("firewall.webdav_wan." + option).c_str(), "short"), 0);
+    char out[64] = "rubbish";
+    EXPECT_EQ(uci2_get_by_name(ctx, "firewall", "webdav_wan", option.c_str(), out, sizeof(out)), 0);
+    EXPECT_STREQ(out, "short");
+    const std::string log = support::log_of([&] {
+        EXPECT_EQ(uci2_get_by_name(ctx, "firewall", "webdav_wan", longer.c_str(), out, sizeof(out)),
+                  -1);
+        EXPECT_EQ(uci2_set_by_name(ctx, "firewall", "webdav_wan", longer.c_str(), "long"), -1);
+    });
+    EXPECT_STREQ(out, "");
+    EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci path too long, path = firewall.webdav_wan.ooo"),
+              2);
+    EXPECT_EQ(got(("firewall.webdav_wan." + option).c_str()), "short");
+
+    const std::string by_index(127 - strlen("firewall.@zone[1]."), 'o');
+    ASSERT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 1, by_index.c_str(), "short"), 0);
+    support::log_of([&] {
+        EXPECT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 1, (by_index + "o").c_str(), "x"), -1);
+        EXPECT_EQ(uci2_get_by_index(ctx, "firewall.@zone", 1, (by_index + "o").c_str(), out, 64),
+                  -1);
+    });
+    EXPECT_EQ(uci2_get_by_index(ctx, "firewall.@zone", 1, by_index.c_str(), out, sizeof(out)), 0);
+    EXPECT_STREQ(out, "short");
+}
+
+TEST_F(Uci, APathThatIsTooLongNamesNoSection)
+{
+    const std::string type = "firewall.@" + std::string(120, 't');
+    EXPECT_TRUE(contains(
+        support::log_of([&] { EXPECT_EQ(uci2_get_section(ctx, type.c_str(), 0), nullptr); }),
+        "uci path too long"));
+}
+
+TEST_F(Uci, WithoutATypeOrNameThereIsNoPath)
+{
+    char out[8] = "rubbish";
+    const std::string log = support::log_of([&] {
+        EXPECT_EQ(uci2_get_by_index(ctx, nullptr, 0, "name", out, sizeof(out)), -1);
+        EXPECT_EQ(uci2_get_by_name(ctx, nullptr, "webdav_wan", "port", out, sizeof(out)), -1);
+        EXPECT_EQ(uci2_set_by_name(ctx, "firewall", nullptr, "port", "1"), -1);
+        EXPECT_EQ(uci2_set_by_index(ctx, nullptr, 0, "name", "x"), -1);
+        EXPECT_EQ(uci2_get_section(ctx, nullptr, 0), nullptr);
+    });
+    EXPECT_STREQ(out, "");
+    EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci "), 5) << log;
+    EXPECT_EQ(uci2_get(ctx, "firewall.webdav_wan.port", nullptr, 8), -1);
+    EXPECT_EQ(uci2_list_item(ctx, "firewall.webdav_wan.proto", 0, nullptr, 8), 0);
+}
+
+TEST_F(Uci, AListNeedsAnOption)
+{
+    for (const char* path : {"firewall.webdav_wan", "firewall.@zone[0]", "firewall"}) {
+        const std::string log = support::log_of([&] {
+            EXPECT_EQ(support::in_child([&] {
+                          EXPECT_EQ(uci2_add_list(ctx, path, "x"), -1);
+                          EXPECT_EQ(uci2_del_list(ctx, path, "x"), -1);
+                          EXPECT_EQ(got("firewall.webdav_wan.target"), "ACCEPT");
+                          EXPECT_EQ(uci2_commit(ctx, "firewall"), 0);
+                          return 0;
+                      }),
+                      0)
+                << path;
+        });
+        EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci option missing, path = "), 2) << log;
+        EXPECT_EQ(read_afresh("firewall.webdav_wan"), "rule");
+        EXPECT_EQ(read_afresh("firewall.webdav_wan.port"), "8080");
+    }
+    EXPECT_EQ(on_disk(), FIREWALL);
+}
+
+TEST_F(Uci, WhateverCharacterATypeHoldsTheFileCanStillBeRead)
+{
+    for (int c = 1; c < 256; ++c) {
+        const std::string type = std::string("ty") + static_cast<char>(c) + "pe";
+        const std::string before = on_disk();
+        const std::string log = support::log_of([&] {
+            const int ret = uci2_add_section("firewall", type.c_str());
+            EXPECT_TRUE(ret == 0 || on_disk() == before) << c;
+            EXPECT_EQ(ret == 0, contains(on_disk(), "config " + type + "\n")) << c;
+        });
+        EXPECT_EQ(on_disk() == before, contains(log, "uci type not valid")) << c;
+        ASSERT_EQ(read_afresh("firewall.webdav_wan.target"), "ACCEPT") << c;
+    }
+    EXPECT_TRUE(contains(on_disk(), "config ty-pe\n"));
+    EXPECT_FALSE(contains(on_disk(), "config ty'pe\n"));
+}
+
+TEST_F(Uci, WhateverCharacterATypeThatIsSetHoldsTheFileCanStillBeRead)
+{
+    for (int c = 1; c < 256; ++c) {
+        const std::string type = std::string("ty") + static_cast<char>(c) + "pe";
+        support::log_of([&] {
+            const bool fresh = uci2_set(ctx, "firewall.fresh", type.c_str()) == 0;
+            const bool old = uci2_set(ctx, "firewall.webdav_wan", type.c_str()) == 0;
+            EXPECT_EQ(fresh, old) << c;
+            EXPECT_TRUE(commit()) << c;
+            EXPECT_EQ(read_afresh("firewall.webdav_wan") == type, old) << c;
+        });
+        ASSERT_EQ(read_afresh("firewall.webdav_wan.target"), "ACCEPT") << c;
+    }
+}
+
+TEST_F(Uci, WhateverCharacterANameHoldsTheFileCanStillBeRead)
+{
+    for (int c = 1; c < 256; ++c) {
+        const std::string name = std::string("na") + static_cast<char>(c) + "me";
+        support::log_of([&] {
+            uci2_set(ctx, ("firewall." + name).c_str(), "rule");
+            uci2_set(ctx, ("firewall.webdav_wan." + name).c_str(), "1");
+            uci2_add_list(ctx, ("firewall.webdav_wan." + name).c_str(), "2");
+            if (uci2_rename(ctx, "firewall.webdav_wan.port", name.c_str()) == 0) {
+                EXPECT_EQ(uci2_rename(ctx, ("firewall.webdav_wan." + name).c_str(), "port"), 0);
+            }
+            if (uci2_rename(ctx, "firewall.webdav_wan", name.c_str()) == 0) {
+                EXPECT_EQ(uci2_rename(ctx, ("firewall." + name).c_str(), "webdav_wan"), 0) << c;
+            }
+            EXPECT_TRUE(commit()) << c;
+        });
+        ASSERT_EQ(read_afresh("firewall.@zone[0].name"), "lan") << c;
+        uci2_free(ctx);
+        support::write_file(file, FIREWALL);
+        support::remove_all("/tmp/.uci");
+        ctx = uci2_new();
+    }
+}
+
+TEST_F(Uci, WhateverCharacterAValueHoldsItIsReadBackOrRefused)
+{
+    for (int c = 1; c < 256; ++c) {
+        const std::string value = std::string("va") + static_cast<char>(c) + "lue";
+        const int ret = uci2_set(ctx, "firewall.webdav_wan.target", value.c_str());
+        EXPECT_EQ(read_afresh("firewall.webdav_wan.target") == value, ret == 0) << c;
+        EXPECT_TRUE(commit()) << c;
+        EXPECT_EQ(read_afresh("firewall.webdav_wan.target") == value, ret == 0) << c;
+        ASSERT_EQ(read_afresh("firewall.webdav_wan.port"), "8080") << c;
+    }
+}
+
+TEST_F(Uci, ASectionThatIsNotThereIsNotMadeUnderItsIndex)
+{
+    EXPECT_EQ(uci2_set(ctx, "firewall.@zone[7]", "zone"), -1);
+    EXPECT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 7, nullptr, "zone"), -1);
+    EXPECT_EQ(uci2_commit(ctx, "firewall"), 0);
+    EXPECT_EQ(on_disk(), FIREWALL);
+}
+
+TEST_F(Uci, AnEqualsSignInAPathWritesNothing)
+{
+    const std::string log = support::log_of([&] {
+        EXPECT_EQ(support::in_child([&] {
+                      EXPECT_EQ(uci2_set(ctx, "firewall.webdav_wan.target=x", "y"), -1);
+                      EXPECT_EQ(uci2_delete(ctx, "firewall.webdav_wan.proto=0"), -1);
+                      EXPECT_EQ(uci2_rename(ctx, "firewall.webdav_wan=x", "y"), -1);
+                      EXPECT_EQ(uci2_add_list(ctx, "firewall.webdav_wan.proto=x", "y"), -1);
+                      EXPECT_EQ(uci2_commit(ctx, "firewall"), 0);
+                      return 0;
+                  }),
+                  0);
+    });
+    EXPECT_EQ(count_of(log, "uci path not valid, path = firewall.webdav_wan"), 4) << log;
+    EXPECT_EQ(on_disk(), FIREWALL);
+}
+
+TEST_F(Uci, APackageIsNeitherSetRenamedNorDeleted)
+{
+    EXPECT_EQ(support::in_child([&] {
+                  EXPECT_EQ(uci2_set(ctx, "firewall", "x"), -1);
+                  EXPECT_EQ(uci2_delete(ctx, "firewall"), -1);
+                  EXPECT_EQ(uci2_rename(ctx, "firewall", "x"), -1);
+                  EXPECT_EQ(uci2_commit(ctx, "firewall"), 0);
+                  return 0;
+              }),
+              0);
+    EXPECT_EQ(on_disk(), FIREWALL);
+}
+
+TEST_F(Uci, AFailedLookUpIsNotLogged)
 {
     EXPECT_EQ(support::log_of([&] {
                   got("firewall.webdav_wan.missing", -1);
