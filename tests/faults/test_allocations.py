@@ -45,7 +45,7 @@ def wait_swept(world, daemon, allocations, meanwhile=lambda: None):
 
 @pytest.mark.needs_fs("ext4")
 @pytest.mark.parametrize("from_on", [False, True], ids=["one", "all-from-it-on"])
-def test_publication_survives_each_allocation_that_fails_in_it(prepared, count, from_on):
+def test_the_publication_survives_each_allocation_that_fails_in_it(prepared, count, from_on):
     world, allocations, environ = prepared
     rig = Rig(world, environ=environ)
     allocations.arm(CJSON, from_on=from_on)
@@ -65,7 +65,7 @@ def swap_disks(world):
 
 @pytest.mark.parametrize("from_on", [False, True], ids=["one", "all-from-it-on"])
 @pytest.mark.parametrize("fresh", [False, True], ids=["known", "fresh"])
-def test_database_survives_each_allocation_that_fails_in_it(prepared, count, from_on, fresh):
+def test_the_database_survives_each_allocation_that_fails_in_it(prepared, count, from_on, fresh):
     world, allocations, environ = prepared
     for disk, name in zip(swap_disks(world), ("sda", "sdb"), strict=True):
         world.plug(disk, name)
@@ -95,7 +95,7 @@ def test_database_survives_each_allocation_that_fails_in_it(prepared, count, fro
     assert daemon.running
 
 
-def test_database_that_cannot_be_opened_keeps_no_memory(prepared):
+def test_a_database_that_cannot_be_opened_keeps_no_memory(prepared):
     world, allocations, environ = prepared
     world.path(DISK_DB).mkdir(parents=True)
     world.plug(swap_disks(world)[0], "sda")
@@ -166,7 +166,7 @@ def test_memory_for_what_cannot_be_read_is_given_back(world, start_daemon, libra
 
 @pytest.mark.needs_fs("ext4")
 @pytest.mark.parametrize("kind", [SQLITE, CJSON, OWN], ids=["sqlite", "cjson", "own"])
-def test_start_without_memory_ends_in_order_or_is_right_once_there_is_some(
+def test_a_start_without_memory_ends_in_order_or_is_right_once_there_is_some(
         world, start_daemon, libraries, count, outcome, kind):
     starts = Starts(world, install(world, libraries, "haste", "alloc"))
     allocations = Allocations(world)

@@ -74,7 +74,7 @@ def fail(rig, stage, call, fault):
     return failed + removed.injected
 
 
-def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
+def test_a_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
         rig, count, long_form, stage, call, errors):
     kept_open = 0
     for error in errors:
@@ -92,7 +92,7 @@ def test_failing_call_in_a_cycle_is_survived_and_the_next_plug_is_right(
     assert rig.daemon.stop() == 0
 
 
-def test_wait_that_keeps_failing_makes_no_busy_loop(rig, count):
+def test_a_wait_that_keeps_failing_makes_no_busy_loop(rig, count):
     begun = time.monotonic()
     with Strace(rig.daemon, ["pselect6", "select"], "error=ENOMEM") as strace:
         time.sleep(SHORTAGE)

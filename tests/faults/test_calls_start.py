@@ -35,7 +35,7 @@ def test_every_call_of_a_start_is_known(starts):
     assert missed == []
 
 
-def test_failing_call_at_start_ends_in_order_or_leads_to_a_right_state(
+def test_a_failing_call_at_start_ends_in_order_or_leads_to_a_right_state(
         starts, count, outcome, long_form, stage, call, errors):
     own = starts.baseline()
     for error in errors:

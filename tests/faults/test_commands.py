@@ -20,7 +20,7 @@ _KILLED = ", ret = 9\n"
 
 
 @pytest.mark.parametrize("tool", _TOOLS)
-def test_command_killed_in_a_cycle_is_survived_and_the_next_plug_is_right(rig, count, tool):
+def test_a_command_killed_in_a_cycle_is_survived_and_the_next_plug_is_right(rig, count, tool):
     mark = rig.daemon.mark()
     # A directory that is there already is not made again.
     rig.world.sh("umount /tmp/mountd/disk2_part1; rmdir /tmp/mountd/disk2_part1")
@@ -48,7 +48,7 @@ def test_service_scripts_killed_around_a_removal_leave_the_removal_whole(rig, co
     rig.check()
 
 
-def test_mount_killed_after_it_mounted_counts_as_mounted(rig):
+def test_a_mount_killed_after_it_mounted_counts_as_mounted(rig):
     world = rig.world
     world.tools.stub("mount", f"""
 case "$*" in
@@ -65,7 +65,7 @@ exec {world.tools.real("mount")} "$@"
 
 
 @pytest.mark.parametrize("tool", ["pgrep", "blkid", "mount", "mkdir", "chmod"])
-def test_command_killed_at_start_leads_to_a_right_state_or_an_orderly_end(
+def test_a_command_killed_at_start_leads_to_a_right_state_or_an_orderly_end(
         world, start_daemon, libraries, count, tool):
     environ = install(world, libraries, "haste")
     starts = Starts(world, environ)
@@ -97,7 +97,7 @@ def hide_shell(world):
     world.run("mv", "/usr/bin/sh", "/usr/bin/sh.hidden")
 
 
-def test_shell_that_is_missing_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
+def test_a_shell_that_is_missing_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
     world = rig.world
     hide_shell(world)
     mark = rig.daemon.mark()
@@ -109,7 +109,7 @@ def test_shell_that_is_missing_for_a_cycle_is_survived_and_the_next_plug_is_righ
     assert rig.daemon.stop() == 0
 
 
-def test_start_without_a_shell_ends_in_order_for_want_of_the_directory_and_the_next_one_works(
+def test_a_start_without_a_shell_ends_in_order_for_want_of_the_directory_and_the_next_one_works(
         world, start_daemon, libraries):
     environ = install(world, libraries, "haste")
     starts = Starts(world, environ)
@@ -122,7 +122,7 @@ def test_start_without_a_shell_ends_in_order_for_want_of_the_directory_and_the_n
     starts.bring_back(world.start_daemon(environ=environ))
 
 
-def test_cycle_is_right_at_the_pace_of_everybody_too(world, start_daemon):
+def test_the_cycle_is_right_at_the_pace_of_everybody_too(world, start_daemon):
     # So the preloaded haste is not what makes it right.
     rig = Rig(world)
     rig.check()

@@ -55,7 +55,7 @@ def start_without(starts):
     return starts.world.start_daemon(environ=starts.environ)
 
 
-def test_full_tmp_for_a_cycle_loses_nothing_and_the_next_plug_is_right(rig):
+def test_a_full_tmp_for_a_cycle_loses_nothing_and_the_next_plug_is_right(rig):
     world, home = rig.world, rig.paths()["/dev/sda1"]
     world.sh(f"echo kept > {home}/note")
     fill(world, "/tmp")
@@ -74,7 +74,7 @@ def test_full_tmp_for_a_cycle_loses_nothing_and_the_next_plug_is_right(rig):
     assert world.read(f"{home}/note") == "kept\n"
 
 
-def test_tmp_without_a_free_inode_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
+def test_a_tmp_without_a_free_inode_for_a_cycle_is_survived_and_the_next_plug_is_right(rig):
     world = rig.world
     used = int(world.run("df", "--output=iused", "/tmp").stdout.split()[-1])
     remount(world, f"nr_inodes={used}", "/tmp")
@@ -85,7 +85,7 @@ def test_tmp_without_a_free_inode_for_a_cycle_is_survived_and_the_next_plug_is_r
     rig.check()
 
 
-def test_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
+def test_a_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
     world = starts.world
     fill(world, "/tmp")
     daemon = start_without(starts)
@@ -98,7 +98,7 @@ def test_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
     assert daemon.stop() == 0
 
 
-def test_status_of_more_than_a_page_stays_whole_in_a_full_tmp_and_with_room_for_half_of_it(
+def test_a_status_of_more_than_a_page_stays_whole_in_a_full_tmp_and_with_room_for_half_of_it(
         world, start_daemon, libraries):
     for name in ("sda", "sdb", "sdc"):
         parts = [Partition("swap", 1001) for _ in range(8)]
@@ -166,7 +166,7 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
     assert not world.exists(HOOK)
 
 
-def test_read_only_database_is_still_read_and_a_remembered_directory_kept(starts):
+def test_a_read_only_database_is_still_read_and_a_remembered_directory_kept(starts):
     world = starts.world
     daemon = start_without(starts)
     world.wait(starts.is_right, 10, "the disk in disk.json")
@@ -189,7 +189,7 @@ def test_read_only_database_is_still_read_and_a_remembered_directory_kept(starts
     assert daemon.stop() == 0
 
 
-def test_full_filesystem_under_the_database_keeps_every_row_and_takes_changes_afterwards(rig):
+def test_a_full_filesystem_under_the_database_keeps_every_row_and_takes_changes_afterwards(rig):
     world = rig.world
     own_config_dir(world, 64)
     before = world.db_rows()
@@ -203,7 +203,7 @@ def test_full_filesystem_under_the_database_keeps_every_row_and_takes_changes_af
     rig.check()
 
 
-def test_full_filesystem_without_a_database_stops_no_mount_and_a_row_follows(starts):
+def test_a_full_filesystem_without_a_database_stops_no_mount_and_a_row_follows(starts):
     world = starts.world
     own_config_dir(world, 64)
     fill(world, CONFIG_DIR)
@@ -245,7 +245,8 @@ def test_sys_block_that_cannot_be_opened_at_start_leaves_the_disks_to_their_anno
     assert daemon.stop() == 0
 
 
-def test_list_of_disks_that_breaks_off_at_start_is_looked_at_again_without_an_announcement(starts):
+def test_a_list_of_disks_that_breaks_off_at_start_is_looked_at_again_without_an_announcement(
+        starts):
     world = starts.world
     daemon = world.start_daemon(environ=starts.environ, held=True)
     with Strace(daemon, ["getdents64"], "error=EIO:when=1", paths=["/sys/block"]) as strace:

@@ -62,7 +62,7 @@ def test_cold_plugged_disks_are_mounted_published_and_remembered(router):
     assert router.disk_num() == "2"
 
 
-def test_hot_plugged_disk_comes_goes_and_returns_to_its_directory(router):
+def test_a_hot_plugged_disk_comes_goes_and_returns_to_its_directory(router):
     daemon = router.start_daemon()
     first, other = (router.partitioned_disk(Partition("ext4", 1100)) for _ in range(2))
     router.hotplug(first, "sda")
@@ -100,7 +100,7 @@ def test_one_partition_is_removed_by_device_and_one_by_directory(router):
     assert router.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
 
 
-def test_safe_removal_unmounts_all_and_an_announced_disk_comes_back(router):
+def test_a_safe_removal_unmounts_all_and_an_announced_disk_comes_back(router):
     disk = router.partitioned_disk(Partition("ext4", 1100))
     router.plug(disk, "sda")
     router.plug(router.whole_disk("ext4"), "sdb")
@@ -117,7 +117,7 @@ def test_safe_removal_unmounts_all_and_an_announced_disk_comes_back(router):
         router.mounted()["/dev/sda1"]]
 
 
-def test_restarted_daemon_forces_old_mounts_off_and_keeps_the_directories(router):
+def test_a_restarted_daemon_forces_old_mounts_off_and_keeps_the_directories(router):
     small, large = router.whole_disk("ext4", 1100), router.whole_disk("ext4", 1300)
     router.plug(small, "sda")
     first = router.start_daemon()
@@ -137,7 +137,7 @@ def test_restarted_daemon_forces_old_mounts_off_and_keeps_the_directories(router
     assert len(router.mounts()) == 2
 
 
-def test_failed_self_check_restarts_the_daemon_through_its_init_script(router):
+def test_a_failed_self_check_restarts_the_daemon_through_its_init_script(router):
     router.tools.init_script("tarn_nas_diskmanager", f"""#!/bin/sh
 [ -e {PID_FILE} ] && exit 1
 exec {router.program} > /run/world/second.log 2>&1
@@ -154,7 +154,7 @@ exec {router.program} > /run/world/second.log 2>&1
     assert router.mounted() == {"/dev/sda": "/tmp/mountd/disk1_part1"}
 
 
-def test_second_instance_is_refused_and_a_stale_pid_file_is_not(router):
+def test_a_second_instance_is_refused_and_a_stale_pid_file_is_not(router):
     router.write(PID_FILE, "4000000")
     daemon = router.start_daemon()
     assert router.read(PID_FILE) == str(daemon.pid)
@@ -167,7 +167,7 @@ def test_second_instance_is_refused_and_a_stale_pid_file_is_not(router):
 
 
 @pytest.mark.takes_minutes
-def test_companion_is_found_by_name_when_the_silence_is_too_long(router):
+def test_the_companion_is_found_by_name_when_the_silence_is_too_long(router):
     router.start_companion()
     daemon = router.start_daemon()
     daemon.wait_log("get app = tarn_nas_sys, pid = ", 100)

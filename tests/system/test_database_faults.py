@@ -61,7 +61,7 @@ def binary_rows(world):
 
 @pytest.mark.needs_fs("ext4")
 @pytest.mark.parametrize("damage", [garbage, truncated, directory, binary_rows])
-def test_damaged_database_stops_no_mount_and_no_removal(world, start_daemon, damage):
+def test_a_damaged_database_stops_no_mount_and_no_removal(world, start_daemon, damage):
     world.path(CONFIG_DIR).mkdir(parents=True)
     message = damage(world)
     cold, hot = world.whole_disk("ext4"), world.partitioned_disk(Partition("ext4", 1100))
@@ -87,7 +87,7 @@ def test_damaged_database_stops_no_mount_and_no_removal(world, start_daemon, dam
 
 
 @pytest.mark.needs_fs("ext4")
-def test_damaged_database_is_left_as_it_is(world, start_daemon):
+def test_a_damaged_database_is_left_as_it_is(world, start_daemon):
     world.path(CONFIG_DIR).mkdir(parents=True)
     garbage(world)
     before = world.path(DISK_DB).read_bytes()
@@ -99,7 +99,7 @@ def test_damaged_database_is_left_as_it_is(world, start_daemon):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_missing_directory_is_made_again_by_the_next_mount(world, daemon):
+def test_a_missing_directory_is_made_again_by_the_next_mount(world, daemon):
     world.path(CONFIG_DIR).rmdir()
     world.hotplug(world.whole_disk("ext4"), "sda")
     daemon.wait_log("mount OK, /dev/sda")
@@ -107,7 +107,7 @@ def test_missing_directory_is_made_again_by_the_next_mount(world, daemon):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_locked_database_stops_no_mount_and_is_used_again_once_it_is_free(world, start_daemon):
+def test_a_locked_database_stops_no_mount_and_is_used_again_once_it_is_free(world, start_daemon):
     disk, late = world.whole_disk("ext4"), world.partitioned_disk(Partition("ext4", 1100))
     world.plug(disk, "sda")
     world.db_execute(TABLE)
@@ -135,7 +135,7 @@ def test_locked_database_stops_no_mount_and_is_used_again_once_it_is_free(world,
 
 
 @pytest.mark.needs_fs("ext4")
-def test_uid_in_two_rows_uses_the_first_and_changes_neither(world, start_daemon):
+def test_a_uid_in_two_rows_uses_the_first_and_changes_neither(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     uid = uid_of(world, "/dev/sda")
     world.db_execute(TABLE)
@@ -180,7 +180,7 @@ def test_quotes_in_a_uid_harm_nothing_and_the_directory_is_remembered(world, sta
 @pytest.mark.needs_fs("ext4")
 @pytest.mark.parametrize("values", [
     ("disk5_part5", None), (None, "/tmp/mountd/disk5_part5")])
-def test_row_with_an_empty_column_counts_as_none_and_is_not_doubled(world, start_daemon, values):
+def test_a_row_with_an_empty_column_counts_as_none_and_is_not_doubled(world, start_daemon, values):
     world.plug(world.whole_disk("ext4"), "sda")
     world.db_execute(TABLE)
     world.db_execute(INSERT, (uid_of(world, "/dev/sda"), "sdz", *values, "no"))
@@ -190,7 +190,7 @@ def test_row_with_an_empty_column_counts_as_none_and_is_not_doubled(world, start
 
 
 @pytest.mark.needs_fs("ext4")
-def test_mountd_text_that_is_neither_yes_nor_no_becomes_yes_with_the_mount(world, start_daemon):
+def test_a_mountd_text_that_is_neither_yes_nor_no_becomes_yes_with_the_mount(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     world.db_execute(TABLE)
     remember(world, uid_of(world, "/dev/sda"), "disk5_part5", mountd="perhaps")

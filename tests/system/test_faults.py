@@ -35,7 +35,7 @@ def mount_calls(world):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next_pass(
+def test_a_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next_pass(
         world, start_daemon):
     stub_mount(world, "/dev/sda1", 1)
     world.plug(world.partitioned_disk(Partition("ext4", 1200, "DATA")), "sda")
@@ -59,7 +59,7 @@ def test_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next_p
 
 
 @pytest.mark.needs_fs("ext4")
-def test_damaged_filesystem_is_mounted_once_it_is_repaired(world, start_daemon):
+def test_a_damaged_filesystem_is_mounted_once_it_is_repaired(world, start_daemon):
     disk = world.whole_disk("ext4", label="SICK")
     world.plug(disk, "sda")
     # Without its group descriptors it is still recognised and cannot be mounted.
@@ -77,7 +77,7 @@ def test_damaged_filesystem_is_mounted_once_it_is_repaired(world, start_daemon):
 
 @pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
-def test_mount_that_never_appears_holds_up_neither_the_other_disk_nor_the_events(
+def test_a_mount_that_never_appears_holds_up_neither_the_other_disk_nor_the_events(
         world, start_daemon):
     stub_mount(world, "/dev/sdb1", 1000)
     good, bad = world.whole_disk("ext4"), world.partitioned_disk(Partition("ext4", 1100))
@@ -135,7 +135,7 @@ def test_without_mount_the_daemon_goes_on_and_mounts_once_it_is_back(world, star
 
 
 @pytest.mark.needs_fs("ext4")
-def test_node_that_vanishes_between_event_and_mount_is_survived(world, daemon):
+def test_a_node_that_vanishes_between_event_and_mount_is_survived(world, daemon):
     doomed, other = world.partitioned_disk(Partition("ext4", 1200)), world.whole_disk("ext4")
     world.hotplug(doomed, "sda")
     daemon.wait_log("=== ===> dev is already add! dev name = sda1")
@@ -151,7 +151,7 @@ def test_node_that_vanishes_between_event_and_mount_is_survived(world, daemon):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_node_that_is_gone_before_its_event_is_read_adds_nothing(world, daemon):
+def test_a_node_that_is_gone_before_its_event_is_read_adds_nothing(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1200))
     world.plug(disk, "sda")
     with daemon.held_still():
@@ -165,7 +165,7 @@ def test_node_that_is_gone_before_its_event_is_read_adds_nothing(world, daemon):
 
 @pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
-def test_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_services_back(
+def test_a_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_services_back(
         world, start_daemon):
     world.plug(world.partitioned_disk(Partition("ext4", 1200), Partition("ext4", 1100)), "sda")
     daemon = start_daemon()
@@ -194,7 +194,7 @@ def test_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_serv
 
 
 @pytest.mark.needs_fs("ext4")
-def test_partition_that_becomes_free_during_the_further_unmounts_is_unmounted(
+def test_a_partition_that_becomes_free_during_the_further_unmounts_is_unmounted(
         world, start_daemon):
     world.plug(world.partitioned_disk(Partition("ext4", 1200)), "sda")
     daemon = start_daemon()

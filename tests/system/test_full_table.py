@@ -93,7 +93,7 @@ def wait_republished(world, daemon):
 
 
 @pytest.mark.takes_minutes
-def test_full_table_refuses_a_ninth_partition_and_a_seventeenth_disk_and_stays_as_it_is(
+def test_a_full_table_refuses_a_ninth_partition_and_a_seventeenth_disk_and_stays_as_it_is(
         world, start_daemon):
     paper = PaperDisks(world)
     for name in disk_names(MAX_DISKS + 1):
@@ -134,7 +134,7 @@ def test_full_table_refuses_a_ninth_partition_and_a_seventeenth_disk_and_stays_a
 
 
 @pytest.mark.takes_minutes
-def test_full_rescan_list_that_shrinks_offers_an_empty_name_which_harms_nothing(
+def test_a_full_rescan_list_that_shrinks_offers_an_empty_name_which_harms_nothing(
         world, start_daemon):
     paper = PaperDisks(world)
     names = disk_names(MAX_DISKS)

@@ -14,7 +14,7 @@ def swap(size_mib, **options):
     return Partition("swap", size_mib, **options)
 
 
-def test_disk_announced_first_comes_with_all_its_partitions_and_only_once(world, daemon):
+def test_a_disk_announced_first_comes_with_all_its_partitions_and_only_once(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1100), swap(1200))
     world.plug(disk, "sda")
     world.send("#add:sda", "#add:sda1", "#add:sda2", "#add:sda")
@@ -28,7 +28,7 @@ def test_disk_announced_first_comes_with_all_its_partitions_and_only_once(world,
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part2"}
 
 
-def test_partition_announced_first_brings_its_disk_and_the_other_partitions(world, daemon):
+def test_a_partition_announced_first_brings_its_disk_and_the_other_partitions(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1100), swap(1200))
     world.plug(disk, "sdb")
     world.send("#add:sdb1", "#add:sdb2", "#add:sdb")

@@ -137,7 +137,7 @@ def test_sizes_are_sectors_times_the_hardware_sector_size(world, start_daemon):
         "sdb1": 8800, "sdb3": 1000}
 
 
-def test_size_and_free_space_are_those_of_the_partition_and_its_filesystem(world, start_daemon):
+def test_the_size_and_free_space_are_those_of_the_partition_and_its_filesystem(world, start_daemon):
     disk = world.partitioned_disk(Partition("ext4", 1200, options=("-m", "40")))
     world.plug(disk, "sda")
     daemon = start_daemon()
@@ -272,7 +272,7 @@ def test_30_s_after_the_last_change_the_files_are_rewritten_in_every_idle_cycle(
     assert directories(world) == {"sda1": "disk1_part1"}
 
 
-def test_disk_count_follows_arrivals_and_departures(world, daemon):
+def test_the_disk_count_follows_arrivals_and_departures(world, daemon):
     first, second = (world.partitioned_disk(swap(1200)) for _ in range(2))
     world.hotplug(first, "sda")
     world.hotplug(second, "sdb")

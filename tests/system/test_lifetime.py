@@ -61,7 +61,7 @@ def test_silence_without_the_companion_ends_the_daemon_with_0_and_keeps_mounts_a
 
 
 @pytest.mark.takes_minutes
-def test_companion_that_ends_during_the_silence_does_not_keep_the_daemon(world, start_daemon):
+def test_a_companion_that_ends_during_the_silence_does_not_keep_the_daemon(world, start_daemon):
     companion = world.start_companion()
     daemon = start_daemon()
     daemon.wait_idle_cycles(10)
@@ -72,7 +72,7 @@ def test_companion_that_ends_during_the_silence_does_not_keep_the_daemon(world, 
 
 @pytest.mark.takes_minutes
 @pytest.mark.needs_fs("ext4")
-def test_safe_removal_makes_the_silence_limit_five_times_as_long(world, start_daemon):
+def test_a_safe_removal_makes_the_silence_limit_five_times_as_long(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     daemon = start_daemon()
     world.safe_remove()
@@ -148,7 +148,7 @@ def test_two_devices_on_one_directory_end_the_daemon_with_a_restart_and_without_
 
 
 @pytest.mark.needs_fs("ext4")
-def test_mounted_device_whose_node_is_gone_ends_the_daemon_with_a_restart_and_without_database(
+def test_a_mounted_device_whose_node_is_gone_ends_the_daemon_with_a_restart_and_without_database(
         world, start_daemon):
     daemon = start_noting_daemon(world, start_daemon)
     world.path("/dev/sda").unlink()
@@ -174,7 +174,7 @@ def really_restarting(world):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_restart_starts_an_instance_that_mounts_everything_again(world, start_daemon):
+def test_a_restart_starts_an_instance_that_mounts_everything_again(world, start_daemon):
     big = world.partitioned_disk(Partition("ext4", 1300), Partition("ext4", 1200))
     small = world.whole_disk("ext4")
     world.plug(small, "sda")
@@ -201,7 +201,7 @@ def test_restart_starts_an_instance_that_mounts_everything_again(world, start_da
 
 
 @pytest.mark.needs_fs("ext4")
-def test_pulled_disk_that_a_process_keeps_busy_leads_to_a_restart(world, start_daemon):
+def test_a_pulled_disk_that_a_process_keeps_busy_leads_to_a_restart(world, start_daemon):
     world.tools.init_script("tarn_nas_diskmanager", NOTING_INIT_SCRIPT)
     disk = world.partitioned_disk(Partition("ext4", 1200))
     world.plug(disk, "sda")

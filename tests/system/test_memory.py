@@ -25,7 +25,7 @@ def wait_rows(world, *rows):
                lambda: f"rows {list(rows)}, where {world.db_rows()} are")
 
 
-def test_first_mount_makes_directory_database_table_and_one_row(world, start_daemon):
+def test_the_first_mount_makes_directory_database_table_and_one_row(world, start_daemon):
     world.plug(world.partitioned_disk(Partition("ext4", 1200)), "sda")
     assert not world.exists("/etc/config/tarn_nas")
     start_daemon()

@@ -19,7 +19,8 @@ from world.state import DISK_JSON, PID_FILE
 DAEMON_INFO = 3 * 8 + 6
 
 
-def test_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cycle(world, daemon):
+def test_the_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cycle(
+        world, daemon):
     daemon.signal(signal.SIGINT)
     daemon.wait_log("get sig = SIGINT, c = 0")
     daemon.wait_idle_cycles(2)
@@ -37,7 +38,7 @@ def test_first_sigint_is_only_logged_and_the_second_ends_the_daemon_within_a_cyc
 
 
 @pytest.mark.needs_fs("ext4")
-def test_end_by_sigint_leaves_mounts_status_files_and_pipes_in_place(world, start_daemon):
+def test_an_end_by_sigint_leaves_mounts_status_files_and_pipes_in_place(world, start_daemon):
     world.plug(world.whole_disk("ext4"), "sda")
     daemon = start_daemon()
     world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
@@ -150,7 +151,7 @@ def unread_bytes(world):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_reader_of_the_output_that_goes_away_neither_ends_the_daemon_nor_makes_it_spin(world):
+def test_the_reader_of_the_output_that_goes_away_neither_ends_the_daemon_nor_makes_it_spin(world):
     if not world.program.exists():
         pytest.skip(f"{world.program} is not built")
     process = world.popen(world.program, stdin=subprocess.DEVNULL, stdout=subprocess.PIPE,

@@ -51,7 +51,7 @@ def test_a_disk_pulled_while_mounted_gives_errors_and_comes_back_whole(world):
 
 
 @pytest.mark.needs_fs("ext4", "ntfs")
-def test_plugged_disk_is_mounted_published_and_remembered(world, daemon):
+def test_a_plugged_disk_is_mounted_published_and_remembered(world, daemon):
     disk = world.partitioned_disk(Partition("ext4", 1200, "DATA"), Partition("ntfs", 500))
     world.hotplug(disk, "sda")
     daemon.wait_log("mount OK, /dev/sda1 ==> /tmp/mountd/disk1_part1")

@@ -14,7 +14,7 @@ def run_program(world, *options, **keywords):
     return world.run(world.program, *options, check=False, **keywords)
 
 
-def test_version_option_prints_two_lines_after_the_option_and_ends_with_1(world):
+def test_the_version_option_prints_two_lines_after_the_option_and_ends_with_1(world):
     done = run_program(world, "-v")
     lines = done.stdout.splitlines()
 
@@ -24,7 +24,7 @@ def test_version_option_prints_two_lines_after_the_option_and_ends_with_1(world)
     assert not world.exists("/tmp/tarn_nas")
 
 
-def test_wrong_option_prints_the_usage_on_standard_error_and_ends_with_1(world):
+def test_a_wrong_option_prints_the_usage_on_standard_error_and_ends_with_1(world):
     done = run_program(world, "-x")
 
     assert done.returncode == 1
@@ -35,7 +35,7 @@ def test_wrong_option_prints_the_usage_on_standard_error_and_ends_with_1(world):
     assert "Usage" not in done.stdout
 
 
-def test_debug_option_changes_nothing_but_its_own_log_line(make_world):
+def test_the_debug_option_changes_nothing_but_its_own_log_line(make_world):
     def lines_of(*options):
         world = make_world()
         daemon = world.start_daemon(*options)
@@ -50,7 +50,7 @@ def test_debug_option_changes_nothing_but_its_own_log_line(make_world):
     assert debug[1:first_cycle + 2] == plain[:first_cycle + 1]
 
 
-def test_clean_start_without_disks_prepares_everything_and_publishes_the_empty_document(
+def test_a_clean_start_without_disks_prepares_everything_and_publishes_the_empty_document(
         world, daemon):
     assert world.read(PID_FILE) == str(daemon.pid)
     for pipe in ("add_remove", "safe_remove", "remove"):
@@ -91,7 +91,7 @@ def test_without_disks_no_rescan_runs_until_an_add_event(world, daemon):
     world.wait(lambda: "sda" in world.parts(), 30, "sda in disk.json")
 
 
-def test_second_instance_ends_with_1_and_leaves_the_first_alone(world, daemon):
+def test_a_second_instance_ends_with_1_and_leaves_the_first_alone(world, daemon):
     before = world.read(PID_FILE)
     second = run_program(world, timeout=20)
 
@@ -102,7 +102,7 @@ def test_second_instance_ends_with_1_and_leaves_the_first_alone(world, daemon):
     daemon.wait_log("===> get event = EVENT_DISK_HEART_BEAT")
 
 
-def test_stale_pid_file_is_deleted_and_the_start_goes_on(world, start_daemon):
+def test_a_stale_pid_file_is_deleted_and_the_start_goes_on(world, start_daemon):
     world.write(PID_FILE, "99999")
     daemon = start_daemon()
     log = daemon.log()
@@ -111,7 +111,7 @@ def test_stale_pid_file_is_deleted_and_the_start_goes_on(world, start_daemon):
     assert world.read(PID_FILE) == str(daemon.pid)
 
 
-def test_pid_file_with_a_single_digit_counts_as_live_when_a_listed_pid_holds_the_digit(world):
+def test_a_pid_file_with_a_single_digit_counts_as_live_when_a_listed_pid_holds_the_digit(world):
     # Pids are small in a world of its own: twenty in a row hold one with a 1.
     bystanders = [world.popen("/bin/sh", "-c", "sleep 30; : tarn_nas_diskmanager")
                   for _ in range(20)]
@@ -127,13 +127,13 @@ def test_pid_file_with_a_single_digit_counts_as_live_when_a_listed_pid_holds_the
     assert world.read(PID_FILE) == "1"
 
 
-def test_empty_pid_file_names_no_process(world, start_daemon):
+def test_an_empty_pid_file_names_no_process(world, start_daemon):
     world.write(PID_FILE, "")
     daemon = start_daemon()
     assert world.read(PID_FILE) == str(daemon.pid)
 
 
-def test_killed_daemon_is_followed_by_one_that_takes_the_stale_pid_file_away(world, start_daemon):
+def test_a_killed_daemon_is_followed_by_one_that_takes_the_stale_pid_file_away(world, start_daemon):
     first = start_daemon()
     first.kill()
     assert world.exists(PID_FILE)
@@ -158,7 +158,7 @@ def test_mounts_left_by_an_earlier_run_are_forced_off_by_device_and_by_path(worl
 
 
 @pytest.mark.needs_fs("ext4")
-def test_block_input_run_takes_over_what_is_mounted_already(world, start_daemon):
+def test_a_block_input_run_takes_over_what_is_mounted_already(world, start_daemon):
     disk = world.whole_disk("ext4")
     world.plug(disk, "sda")
     world.run("mkdir", "-p", "/tmp/mountd/disk7_part3")
@@ -187,7 +187,7 @@ def test_pipes_that_cannot_be_made_end_the_daemon_with_0_and_without_a_pid_file(
     assert not world.exists(PID_FILE)
 
 
-def test_output_comes_line_by_line_in_order_with_that_of_the_commands(world, start_daemon):
+def test_the_output_comes_line_by_line_in_order_with_that_of_the_commands(world, start_daemon):
     world.tools.stub("blkid", 'echo "blkid says something" >&2\n')
     world.plug(world.blank_disk(), "sda")
     daemon = start_daemon()
