@@ -88,7 +88,7 @@ def test_the_database_survives_each_allocation_that_fails_in_it(prepared, count,
     count(f"SQLite {'all from the Nth on' if from_on else 'the Nth'}, "
           f"{'no rows yet' if fresh else 'rows there'}",
           sum(operation.failed for operation in done))
-    world.wait(lambda: len(world.db_rows()) == 2 * SWAPS, 20, "all rows again")
+    world.wait(lambda: len(world.db_rows()) == 2 * SWAPS, 30, "all rows again")
     assert not world.db_fault()
     if not fresh:
         assert world.db_rows() == before
@@ -103,7 +103,7 @@ def test_a_database_that_cannot_be_opened_keeps_no_memory(prepared):
     daemon = world.start_daemon(environ=environ)
     # Counted, and none fails.
     allocations.arm(SQLITE, first=NEVER, step=0)
-    world.wait(lambda: len(allocations.operations()) > 2 * SWAPS, 20, "a pass over the partitions")
+    world.wait(lambda: len(allocations.operations()) > 2 * SWAPS, 30, "a pass over the partitions")
     allocations.disarm()
     assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
     assert [operation for operation in allocations.operations() if operation.left] == []
@@ -175,7 +175,7 @@ def test_a_start_without_memory_ends_in_order_or_is_right_once_there_is_some(
         daemon = starts.held()
         allocations.arm(kind, first=first, every=every, step=0, from_on=kind != OWN)
         daemon.release()
-        world.wait(lambda: "no event ..." in daemon.log() or not daemon.running, 20, "a cycle")
+        world.wait(lambda: "no event ..." in daemon.log() or not daemon.running, 30, "a cycle")
         allocations.disarm()
         failed = allocations.own_failed + sum(done.failed for done in allocations.operations())
         assert failed > 0

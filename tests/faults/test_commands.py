@@ -74,7 +74,7 @@ def test_a_command_killed_at_start_leads_to_a_right_state_or_an_orderly_end(
     if tool == "mkdir":
         world.sh("rm -rf /tmp/tarn_nas")
     daemon = world.start_daemon(environ=environ, wait=False)
-    world.wait(lambda: _KILLED in daemon.log(), 20, "a killed command")
+    world.wait(lambda: _KILLED in daemon.log(), 30, "a killed command")
     if tool == "mkdir":
         # No directory, no pipes.
         assert daemon.wait_exit() == 0

@@ -27,7 +27,7 @@ def fill(world, folder):
     def full():
         world.sh(f"cat /dev/zero >> {folder}/{FILLER}", check=False)
         return os.statvfs(world.path(folder)).f_bavail == 0
-    world.wait(full, 10, f"a full {folder}")
+    world.wait(full, 30, f"a full {folder}")
 
 
 def failed_publication(daemon):
@@ -89,7 +89,7 @@ def test_a_full_tmp_at_start_leaves_the_disks_alone_until_there_is_room(starts):
     world = starts.world
     fill(world, "/tmp")
     daemon = start_without(starts)
-    world.wait(lambda: "=== ===> dev err, dev = /dev/sda" in daemon.log(), 10, "the look at sda")
+    world.wait(lambda: "=== ===> dev err, dev = /dev/sda" in daemon.log(), 30, "the look at sda")
     # Full is full: the pid file is there and empty.
     assert world.read(PID_FILE) == ""
     assert world.mounted() == {}
@@ -105,7 +105,7 @@ def test_a_status_of_more_than_a_page_stays_whole_in_a_full_tmp_and_with_room_fo
         world.plug(world.partitioned_disk(*parts), name)
     world.start_companion()
     daemon = world.start_daemon(environ=install(world, libraries, "haste"))
-    world.wait(lambda: len(world.parts()) == 24, 20, "24 partitions in disk.json")
+    world.wait(lambda: len(world.parts()) == 24, 30, "24 partitions in disk.json")
     whole = world.read(DISK_JSON)
     assert len(whole) > PAGE
 
@@ -148,7 +148,7 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
     assert world.exists(HOOK)
     remount(world, "ro", "/etc")
     daemon = start_without(starts)
-    world.wait(starts.is_right, 10, "the disk in disk.json")
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert "open err, db = /etc/config/tarn_nas/disk.db" in daemon.log()
     assert "sqlite err = unable to open database file" in daemon.log()
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
@@ -158,8 +158,8 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
     remount(world, "rw", "/etc")
     world.send("#remove_dev:sda")
     world.announce(starts.disk)
-    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 10, "a row")
-    world.wait(starts.is_right, 10, "the disk in disk.json")
+    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 30, "a row")
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert daemon.stop() == 0
     # The hook of the system's own is the next start's to delete.
     start_without(starts)
@@ -169,14 +169,14 @@ def test_etc_that_is_read_only_at_start_stops_no_mount_and_is_written_to_afterwa
 def test_a_read_only_database_is_still_read_and_a_remembered_directory_kept(starts):
     world = starts.world
     daemon = start_without(starts)
-    world.wait(starts.is_right, 10, "the disk in disk.json")
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert daemon.stop() == 0
     world.db_execute("update disk set disk_name='disk7_part2', mountd='no',"
                      " mount_path='/tmp/mountd/disk7_part2'")
     world.plug(world.whole_disk("ext4"), "sdb")
     remount(world, "ro", "/etc")
     daemon = start_without(starts)
-    world.wait(lambda: len(world.parts()) == 2, 20, "two disks in disk.json")
+    world.wait(lambda: len(world.parts()) == 2, 30, "two disks in disk.json")
 
     assert "sqlite err = attempt to write a readonly database" in daemon.log()
     paths = world.mounted()
@@ -185,7 +185,7 @@ def test_a_read_only_database_is_still_read_and_a_remembered_directory_kept(star
     assert [(row["disk_name"], row["mountd"]) for row in world.db_rows()] == [
         ("disk7_part2", "no")]
     world.safe_remove()
-    world.wait(lambda: world.mounted() == {}, 20, "the unmount")
+    world.wait(lambda: world.mounted() == {}, 30, "the unmount")
     assert daemon.stop() == 0
 
 
@@ -208,14 +208,14 @@ def test_a_full_filesystem_without_a_database_stops_no_mount_and_a_row_follows(s
     own_config_dir(world, 64)
     fill(world, CONFIG_DIR)
     daemon = start_without(starts)
-    world.wait(starts.is_right, 10, "the disk in disk.json")
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert "sqlite err = " in daemon.log()
     assert not world.path(DISK_DB).exists() or world.path(DISK_DB).stat().st_size == 0
     world.path(f"{CONFIG_DIR}/{FILLER}").unlink()
     starts.bring_back(daemon)
     world.send("#remove_dev:sda")
     world.announce(starts.disk)
-    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 10, "a row")
+    world.wait(lambda: [row["mountd"] for row in world.db_rows()] == ["yes"], 30, "a row")
 
 
 def test_sys_block_that_cannot_be_opened_for_a_cycle_takes_no_disk_away(rig):
@@ -241,7 +241,7 @@ def test_sys_block_that_cannot_be_opened_at_start_leaves_the_disks_to_their_anno
     assert world.mounted() == {}
     # Nothing is looked for before the first disk is known.
     world.announce(starts.disk)
-    world.wait(starts.is_right, 10, "the announced disk")
+    world.wait(starts.is_right, 30, "the announced disk")
     assert daemon.stop() == 0
 
 
@@ -255,5 +255,5 @@ def test_a_list_of_disks_that_breaks_off_at_start_is_looked_at_again_without_an_
         daemon.wait_started()
     assert strace.injected == 1
     assert "d_name = sda" not in daemon.log()[:daemon.log().index("have disk = ")]
-    world.wait(starts.is_right, 10, "the disk in disk.json")
+    world.wait(starts.is_right, 30, "the disk in disk.json")
     assert daemon.stop() == 0

@@ -8,7 +8,7 @@ from pathlib import Path
 from world import WaitTimeout, wait_for
 
 PROGRAM = "strace"
-_END = 15
+_END = 30
 _QUIET = 1
 
 

@@ -28,7 +28,7 @@ FILE_INSTANTS = [*DATABASE_INSTANTS, *DATABASE_INSTANTS,
 START_UP_SECONDS = 9
 # No kill is later, with the time that the last events before it may take.
 STORM_SECONDS = 60
-SCAN_TIMEOUT, CYCLE_SECONDS = 90, 4
+SCAN_TIMEOUT, CYCLE_TIMEOUT = 90, 30
 SELF_CHECK = ("dev not find, dev = ", "mount path err:")
 # What the last of these texts in the log says about the moment of a kill.
 PHASES = {"pid Not exist": "start-up", "pid exist": "start-up", "scan path = ": "discovery",
@@ -110,7 +110,7 @@ class StormyRouter:
         world, begun = self.world, time.time()
         self.start()
         self._wait_scanned()
-        world.wait(lambda: self._status_is_sound(begun), CYCLE_SECONDS, "a valid disk.json")
+        world.wait(lambda: self._status_is_sound(begun), CYCLE_TIMEOUT, "a valid disk.json")
         paths = {f"/dev/{name}": f"/tmp/mountd/{place}" for name, place in self.expected().items()}
         world.wait(lambda: world.mounted() == paths, 30,
                    lambda: f"{paths} mounted, where {world.mounted()} is")
