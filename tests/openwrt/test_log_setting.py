@@ -19,6 +19,9 @@ OK = "mount.cpp(198)mount OK, /dev/{0} ==> /tmp/mountd/disk1_part1"
 FAILED = "Warning[mount.cpp:195]=== === === mount ERROR, /dev/{0} ==> /tmp/mountd/disk1_part1"
 UMOUNT = "Warning[removal.cpp:55]==> umount dev = {0}"
 OWN = "Warning[discovery.cpp:72]router's own disk, dev = {0}"
+PART = "mount.cpp(159)=== ===> mount sub part, i = 0, name = {0}"
+ROOT = "mount.cpp(146)=== ===> mount root part, dev name = {0}"
+UNKNOWN = "ERROR[mount.cpp:188]err fs type = ERR FS"
 TIMEOUT = "Warning[manager.cpp:74]sys timeout, 61 > 60"
 AGAIN = "manager.cpp(243)manager work again!"
 IDLE = "Warning[manager.cpp:262]no event ..."
@@ -44,6 +47,7 @@ NOT_TOLD = [
     AGAIN,
     TIMEOUT,
     UMOUNT.format(""),
+    PART.format("sda1"),
     "mount.cpp(171)*** *** *** mount part, status = 1",
     "Warning[mount.cpp:173]already mount sda1 ==> /tmp/mountd/disk1_part1",
     "mount_table.cpp(79)get dev mount[0] /dev/sda1 ==> /tmp/mountd/disk1_part1",
@@ -95,7 +99,8 @@ def test_a_line_keeps_its_blanks_and_backslashes(logged):
 
 @pytest.mark.parametrize("text", [
     "mount OK, %s ==> %s", "=== === === mount ERROR, %s ==> %s", "==> umount dev = %s", "clear dev = %s",
-    "router's own disk, dev = %s", "===> safe remove disk", "mount path err:", "%s ===> %s",
+    "=== ===> mount root part, dev name = %s", "=== ===> mount sub part, i = %d, name = %s",
+    "err fs type = %s", "router's own disk, dev = %s", "===> safe remove disk", "mount path err:", "%s ===> %s",
     "dev not find, dev = %s", "===> pid exist, file = %s", "sys timeout, %d > %d", "no event ...",
     "get event = %s", "manager work again!", "scan path = %s"])
 def test_the_daemon_says_what_is_looked_for(text):
@@ -113,6 +118,13 @@ def test_what_comes_in_every_pass_is_told_once(logged, line):
 def test_a_partition_that_has_been_mounted_removed_or_tried_afresh_is_told_again(logged, between):
     lines = logged(FAILED.format("sda1"), between, FAILED.format("sda1"))
     assert lines.count(FAILED.format("sda1")) == 2
+
+
+@pytest.mark.parametrize("part", [PART.format("sda1"), ROOT.format("sda")])
+def test_a_filesystem_that_is_never_mounted_is_told_once_with_its_partition(logged, part):
+    assert logged(SCAN, part, UNKNOWN, IDLE, part, UNKNOWN) == [part, UNKNOWN]
+    other = PART.format("sdb1")
+    assert logged(SCAN, part, UNKNOWN, other, UNKNOWN, part, UNKNOWN) == [part, UNKNOWN, other, UNKNOWN]
 
 
 def test_what_becomes_of_one_disk_says_nothing_of_another(logged):
