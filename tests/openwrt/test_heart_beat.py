@@ -13,7 +13,7 @@ from world.state import PID_FILE
 
 # The daemon's patience without an event, in its own seconds.
 SILENCE = 60
-HASTE = 20
+HASTE = 10
 
 
 @pytest.fixture
@@ -154,7 +154,7 @@ def test_nobody_plugs_anything_and_the_daemon_lives_on_in_silence(hasty_router, 
     router.world.tools.record("umount")
     syslog = router.world.syslog()
     pid = router.start()
-    lives_on(router, pid, 3600 if long_form else 900)
+    lives_on(router, pid, 3600 if long_form else 600)
     assert router.world.tools.commands() == []
     assert router.output() == ""
     assert syslog.messages() == []
@@ -165,7 +165,7 @@ def test_after_a_safe_removal_it_lives_on_as_well(hasty_router):
     pid = router.start()
     router.world.sh(f"printf '#safe_remove\\n' 1<>{PIPES['add_remove']}")
     wait_for(lambda: "disk safe remove ..." in router.output(), 20, "the safe removal")
-    lives_on(router, pid, 900)
+    lives_on(router, pid, 300)
 
 
 def test_without_it_the_daemon_ends(hasty_router):
