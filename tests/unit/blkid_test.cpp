@@ -14,7 +14,7 @@ std::string found(const char* line, const char* key, const char* ends = BLKID_WO
 
 }  // namespace
 
-TEST(BlkidFind, TakesTheValueOfTheFirstKey)
+TEST(BlkidFind, takes_the_value_of_the_first_key)
 {
     EXPECT_EQ(found("/dev/sda1: LABEL=\"L\" UUID=\"1\" UUID=\"2\"", "UUID="), "1");
     EXPECT_EQ(found("/dev/sda1: PARTUUID=\"p\" UUID=\"1\"", "UUID="), "p");
@@ -24,20 +24,20 @@ TEST(BlkidFind, TakesTheValueOfTheFirstKey)
     EXPECT_EQ(found("", "UUID="), "nothing");
 }
 
-TEST(BlkidFind, EndsATypeAtItsQuoteAndAWordAlsoAtASpace)
+TEST(BlkidFind, ends_a_type_at_its_quote_and_a_word_also_at_a_space)
 {
     EXPECT_EQ(found("LABEL=\"My Disk\" TYPE=\"a b\"", "LABEL="), "My");
     EXPECT_EQ(found("LABEL=\"My Disk\" TYPE=\"a b\"", "TYPE=", BLKID_QUOTE), "a b");
 }
 
-TEST(BlkidFind, OfCutOutputTakesWhatIsThere)
+TEST(BlkidFind, of_cut_output_takes_what_is_there)
 {
     EXPECT_EQ(found("UUID=\"12", "UUID="), "12");
     EXPECT_EQ(found("UUID=\"", "UUID="), "");
     EXPECT_EQ(found("UUID=", "UUID="), "");
 }
 
-TEST(BlkidKnows, TheDeviceWhosePathBeginsTheLine)
+TEST(BlkidKnows, the_device_whose_path_begins_the_line)
 {
     EXPECT_TRUE(blkid_knows("/dev/sda1: UUID=\"1\"\n", "/dev/sda1"));
     EXPECT_FALSE(blkid_knows("/dev/sdb1: UUID=\"1\"\n", "/dev/sda1"));

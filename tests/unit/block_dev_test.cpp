@@ -5,9 +5,17 @@
 #include <sys/vfs.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/images.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::contains;
 using support::log_of;
@@ -149,7 +157,7 @@ int statfs(const char* path, struct statfs* info)
 #endif
 }
 
-TEST(DevNameIsDisk, TakesTheHandledNames)
+TEST(DevNameIsDisk, takes_the_handled_names)
 {
     for (const char* name : {"sda", "sdz", "sdaa", "sda1", "hdb", "hda1", "mmcblk0", "mmcblk0p1",
                              "mmcblk0boot0", "mmcblk", "sd1", "hd-"}) {
@@ -157,7 +165,7 @@ TEST(DevNameIsDisk, TakesTheHandledNames)
     }
 }
 
-TEST(DevNameIsDisk, RefusesEveryOtherName)
+TEST(DevNameIsDisk, refuses_every_other_name)
 {
     for (const char* name :
          {"",        "s",     "sd",   "hd",        "mm",          "mmc0", "mmcbl", "mmcbl0",
@@ -168,7 +176,7 @@ TEST(DevNameIsDisk, RefusesEveryOtherName)
     EXPECT_EQ(dev_name_is_disk(nullptr), 1);
 }
 
-TEST(DevNameIsDisk, RefusesNamesThatAShellWouldRead)
+TEST(DevNameIsDisk, refuses_names_that_a_shell_would_read)
 {
     for (const char* name :
          {"sda;reboot", "sd$(reboot)", "sda 1", "sda`x`", "mmcblk0|x", "sda/1"}) {
@@ -176,7 +184,7 @@ TEST(DevNameIsDisk, RefusesNamesThatAShellWouldRead)
     }
 }
 
-TEST_F(SysBlock, WholeDisksAreItsEntries)
+TEST_F(SysBlock, whole_disks_are_its_entries)
 {
     make_dir("/sys/block/sda/sda1");
     EXPECT_EQ(sys_block_has_dev("sda"), 0);
@@ -185,7 +193,7 @@ TEST_F(SysBlock, WholeDisksAreItsEntries)
     EXPECT_EQ(sys_block_has_dev(nullptr), 1);
 }
 
-TEST_F(SysBlock, TheParentIsTheDiskWhoseDirectoryHoldsThePartition)
+TEST_F(SysBlock, the_parent_is_the_disk_whose_directory_holds_the_partition)
 {
     make_dir("/sys/block/sda/sda1");
     make_dir("/sys/block/sdb/sdb1");
@@ -204,7 +212,7 @@ TEST_F(SysBlock, TheParentIsTheDiskWhoseDirectoryHoldsThePartition)
     }
 }
 
-TEST_F(SysBlock, ADiskHasNoParent)
+TEST_F(SysBlock, a_disk_has_no_parent)
 {
     make_dir("/sys/block/sda/sda1");
     filled out;
@@ -215,7 +223,7 @@ TEST_F(SysBlock, ADiskHasNoParent)
     });
 }
 
-TEST_F(SysBlock, OnlyHandledDisksAreParents)
+TEST_F(SysBlock, only_handled_disks_are_parents)
 {
     make_dir("/sys/block/nvme0n1/nvme0n1p1");
     make_dir("/sys/block/loop0/sda1");
@@ -226,7 +234,7 @@ TEST_F(SysBlock, OnlyHandledDisksAreParents)
     });
 }
 
-TEST_F(SysBlock, TheParentIsCutToItsBuffer)
+TEST_F(SysBlock, the_parent_is_cut_to_its_buffer)
 {
     make_dir("/sys/block/mmcblk0/mmcblk0p1");
     filled out;
@@ -234,7 +242,7 @@ TEST_F(SysBlock, TheParentIsCutToItsBuffer)
     EXPECT_EQ(out.text(4), "mmc");
 }
 
-TEST_F(SysBlock, TheSectorsAreTheNumberInTheSizeFile)
+TEST_F(SysBlock, the_sectors_are_the_number_in_the_size_file)
 {
     struct {
         const char* content;
@@ -256,7 +264,7 @@ TEST_F(SysBlock, TheSectorsAreTheNumberInTheSizeFile)
     }
 }
 
-TEST_F(SysBlock, TheSectorsComeFromTheDisksDirectoryAsAFallback)
+TEST_F(SysBlock, the_sectors_come_from_the_disks_directory_as_a_fallback)
 {
     write_file("/sys/block/sda/sda1/size", "4096\n");
     uint64_t sectors = 0;
@@ -268,7 +276,7 @@ TEST_F(SysBlock, TheSectorsComeFromTheDisksDirectoryAsAFallback)
     EXPECT_EQ(sectors, 2048U);
 }
 
-TEST_F(SysBlock, MissingSectorsLeaveTheValueAndNameTheFallback)
+TEST_F(SysBlock, missing_sectors_leave_the_value_and_name_the_fallback)
 {
     uint64_t sectors = 77;
     std::string log = log_of([&] { dev_get_sectors("sda", "sda1", &sectors); });
@@ -276,7 +284,7 @@ TEST_F(SysBlock, MissingSectorsLeaveTheValueAndNameTheFallback)
     EXPECT_EQ(log, "block_dev.cpp(N)get size err, file = /sys/block/sda/sda1/size\n");
 }
 
-TEST_F(SysBlock, AnEmptySizeFileLeavesTheValueAndIsLogged)
+TEST_F(SysBlock, an_empty_size_file_leaves_the_value_and_is_logged)
 {
     write_file("/sys/class/block/sda1/size", "");
     write_file("/sys/block/sda/sda1/size", "4096\n");
@@ -286,7 +294,7 @@ TEST_F(SysBlock, AnEmptySizeFileLeavesTheValueAndIsLogged)
     EXPECT_EQ(log, "block_dev.cpp(N)get size err, file = /sys/class/block/sda1/size\n");
 }
 
-TEST_F(SysBlock, TheSectorSizeStandsInTheDisksQueue)
+TEST_F(SysBlock, the_sector_size_stands_in_the_disks_queue)
 {
     write_file("/sys/block/sda/queue/hw_sector_size", "4096\n");
     uint64_t bytes = 0;
@@ -295,7 +303,7 @@ TEST_F(SysBlock, TheSectorSizeStandsInTheDisksQueue)
     EXPECT_EQ(log, "block_dev.cpp(N)dev = sda, get sector size = 4096(4096)\n");
 }
 
-TEST_F(SysBlock, APartitionHasNoSectorSize)
+TEST_F(SysBlock, a_partition_has_no_sector_size)
 {
     write_file("/sys/block/sda/queue/hw_sector_size", "4096\n");
     uint64_t bytes = 77;
@@ -309,7 +317,7 @@ TEST_F(SysBlock, APartitionHasNoSectorSize)
     EXPECT_EQ(bytes, 77U);
 }
 
-TEST(PathGetSpace, CountsTheBlocksReservedForTheSuperuserAsFree)
+TEST(PathGetSpace, counts_the_blocks_reserved_for_the_superuser_as_free)
 {
     struct statfs reserved {};
     reserved.f_bsize = 4096;
@@ -325,7 +333,7 @@ TEST(PathGetSpace, CountsTheBlocksReservedForTheSuperuserAsFree)
     EXPECT_EQ(free_bytes, 2000000000ULL * 4096);
 }
 
-TEST(PathGetSpace, AFailedQueryGivesTheSystemsError)
+TEST(PathGetSpace, a_failed_query_gives_the_systems_error)
 {
     uint64_t total = 77;
     statfs_fails = true;
@@ -335,7 +343,7 @@ TEST(PathGetSpace, AFailedQueryGivesTheSystemsError)
     EXPECT_EQ(log, "ERROR[block_dev.cpp:N](" + std::string(strerror(EIO)) + ")err file = /tmp\n");
 }
 
-TEST(PathGetSpace, EitherOutputMayBeMissing)
+TEST(PathGetSpace, either_output_may_be_missing)
 {
     uint64_t total = 0;
     uint64_t free_bytes = 0;
@@ -346,7 +354,7 @@ TEST(PathGetSpace, EitherOutputMayBeMissing)
     EXPECT_GT(free_bytes, 0U);
 }
 
-TEST(PathGetSpace, OfAMissingPathFails)
+TEST(PathGetSpace, of_a_missing_path_fails)
 {
     uint64_t total = 77;
     std::string log =
@@ -355,7 +363,7 @@ TEST(PathGetSpace, OfAMissingPathFails)
     EXPECT_EQ(log, "ERROR[block_dev.cpp:N]file not exist, file = /tmp/missing\n");
 }
 
-TEST_F(Blkid, IsAskedThroughAScratchFileThatIsDeleted)
+TEST_F(Blkid, is_asked_through_a_scratch_file_that_is_deleted)
 {
     answer("/dev/sda1: UUID=\"12-34\" TYPE=\"vfat\"\n");
     filled out;
@@ -367,7 +375,7 @@ TEST_F(Blkid, IsAskedThroughAScratchFileThatIsDeleted)
     EXPECT_FALSE(std::filesystem::exists(SCRATCH));
 }
 
-TEST_F(Blkid, TheFirstPlaceOfTheKeyWins)
+TEST_F(Blkid, the_first_place_of_the_key_wins)
 {
     struct {
         const char* line;
@@ -399,13 +407,13 @@ TEST_F(Blkid, TheFirstPlaceOfTheKeyWins)
     }
 }
 
-TEST_F(Blkid, ADeviceWithAPartuuidAloneYieldsItOnTheUuidQuery)
+TEST_F(Blkid, a_device_with_a_partuuid_alone_yields_it_on_the_uuid_query)
 {
     answer("/dev/sda1: PARTUUID=\"6a1b2c3d-01\"\n");
     EXPECT_EQ(value("UUID="), "6a1b2c3d-01");
 }
 
-TEST_F(Blkid, CopiesAtMostTheBuffersSizeWithoutATerminatingZero)
+TEST_F(Blkid, copies_at_most_the_buffers_size_without_a_terminating_zero)
 {
     struct {
         const char* value;
@@ -426,7 +434,7 @@ TEST_F(Blkid, CopiesAtMostTheBuffersSizeWithoutATerminatingZero)
     }
 }
 
-TEST_F(Blkid, AWholeArrayAlwaysEndsWithAZero)
+TEST_F(Blkid, a_whole_array_always_ends_with_a_zero)
 {
     for (const char* text : {"123456", "1234567", "12345678"}) {
         answer(std::string("/dev/sda1: LABEL=\"") + text + "\"\n");
@@ -442,7 +450,7 @@ TEST_F(Blkid, AWholeArrayAlwaysEndsWithAZero)
     }
 }
 
-TEST_F(Blkid, TheBufferIsZeroFilledAlsoWhenNothingIsFound)
+TEST_F(Blkid, the_buffer_is_zero_filled_also_when_nothing_is_found)
 {
     answer("");
     filled out;
@@ -452,7 +460,7 @@ TEST_F(Blkid, TheBufferIsZeroFilledAlsoWhenNothingIsFound)
     EXPECT_FALSE(std::filesystem::exists(SCRATCH));
 }
 
-TEST_F(Blkid, AFailureLeavesAnEmptyValue)
+TEST_F(Blkid, a_failure_leaves_an_empty_value)
 {
     stubs.add("blkid", "exit 2");
     EXPECT_EQ(value("UUID="), "");
@@ -464,14 +472,14 @@ TEST_F(Blkid, AFailureLeavesAnEmptyValue)
     EXPECT_TRUE(contains(log, "del err! not exist file = /tmp/disk_uid.txt\n")) << log;
 }
 
-TEST_F(Blkid, AnOldAnswerIsNotTakenForANewOne)
+TEST_F(Blkid, an_old_answer_is_not_taken_for_a_new_one)
 {
     write_file(SCRATCH, "/dev/sdb1: UUID=\"old\"\n");
     answer("/dev/sda1: TYPE=\"vfat\"\n");
     EXPECT_EQ(value("UUID="), "");
 }
 
-TEST_F(Blkid, ANullArgumentIsLoggedAndAsksNothing)
+TEST_F(Blkid, a_null_argument_is_logged_and_asks_nothing)
 {
     answer("");
     filled out;
@@ -487,7 +495,7 @@ TEST_F(Blkid, ANullArgumentIsLoggedAndAsksNothing)
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(Blkid, TheLabelIsAskedWithoutEncoding)
+TEST_F(Blkid, the_label_is_asked_without_encoding)
 {
     answer("/dev/sda1: LABEL=\"Disk\" UUID=\"1\"\n");
     filled out;
@@ -499,14 +507,14 @@ TEST_F(Blkid, TheLabelIsAskedWithoutEncoding)
     EXPECT_FALSE(std::filesystem::exists(SCRATCH));
 }
 
-TEST_F(Blkid, ALabelWithASpaceIsCutThereInBothQueries)
+TEST_F(Blkid, a_label_with_a_space_is_cut_there_in_both_queries)
 {
     answer("/dev/sda1: LABEL=\"My Disk\" UUID=\"1\"\n");
     EXPECT_EQ(value("LABEL="), "My");
     EXPECT_EQ(label(), "My");
 }
 
-TEST_F(Blkid, ACommandOfMoreThan127CharactersIsCut)
+TEST_F(Blkid, a_command_of_more_than_127_characters_is_cut)
 {
     stubs.add("blkid", "echo 'UUID=\"1\"'");
     // "blkid /dev/", " > " and the scratch file are 31 characters.
@@ -524,7 +532,7 @@ TEST_F(Blkid, ACommandOfMoreThan127CharactersIsCut)
     support::remove_all("/tmp/disk_uid.tx");
 }
 
-TEST(RealBlkid, TellsUuidAndLabelOfAVolume)
+TEST(RealBlkid, tells_uuid_and_label_of_a_volume)
 {
     support::remove_all("/run/blkid");
     support::image disk(16 << 20, "/dev/sdy1");
@@ -542,7 +550,7 @@ TEST(RealBlkid, TellsUuidAndLabelOfAVolume)
     EXPECT_EQ(raw.text(128), "My");
 }
 
-TEST_F(LabelScript, ItsFirstLineIsTheLabelSpacesKept)
+TEST_F(LabelScript, its_first_line_is_the_label_spaces_kept)
 {
     struct {
         const char* output;
@@ -563,7 +571,7 @@ TEST_F(LabelScript, ItsFirstLineIsTheLabelSpacesKept)
     }
 }
 
-TEST_F(LabelScript, GetsTheBareDeviceNameAndItsOutputStays)
+TEST_F(LabelScript, gets_the_bare_device_name_and_its_output_stays)
 {
     answer("Disk\n");
     filled out;
@@ -574,7 +582,7 @@ TEST_F(LabelScript, GetsTheBareDeviceNameAndItsOutputStays)
     EXPECT_EQ(support::read_file(SCRIPT_OUTPUT), "Disk\n");
 }
 
-TEST_F(LabelScript, WithoutTheScriptThereIsNoLabelAndNoLog)
+TEST_F(LabelScript, without_the_script_there_is_no_label_and_no_log)
 {
     filled out;
     std::string log = log_of([&] { EXPECT_EQ(script_get_label("sda1", out.bytes, 128), 1); });
@@ -582,7 +590,7 @@ TEST_F(LabelScript, WithoutTheScriptThereIsNoLabelAndNoLog)
     EXPECT_EQ(out.first(128), std::string(128, '\0'));
 }
 
-TEST_F(LabelScript, WithoutItsOutputThereIsNoLabel)
+TEST_F(LabelScript, without_its_output_there_is_no_label)
 {
     write_file(SCRIPT_OUTPUT, "old\n");
     stubs.add_at(SCRIPT, "rm -f /tmp/disk_label");
@@ -591,7 +599,7 @@ TEST_F(LabelScript, WithoutItsOutputThereIsNoLabel)
     EXPECT_EQ(out.first(128), std::string(128, '\0'));
 }
 
-TEST_F(LabelScript, ANullArgumentIsLogged)
+TEST_F(LabelScript, a_null_argument_is_logged)
 {
     filled out;
     std::string log = log_of([&] {
@@ -601,7 +609,7 @@ TEST_F(LabelScript, ANullArgumentIsLogged)
     EXPECT_EQ(log, "ERROR[block_dev.cpp:N]err!\nERROR[block_dev.cpp:N]err!\n");
 }
 
-TEST_F(LabelScript, AWholeArrayAlwaysEndsWithAZero)
+TEST_F(LabelScript, a_whole_array_always_ends_with_a_zero)
 {
     answer("12345678\n");
     char out[8] = {'#', '#', '#', '#', '#', '#', '#', '#'};
@@ -609,7 +617,7 @@ TEST_F(LabelScript, AWholeArrayAlwaysEndsWithAZero)
     EXPECT_EQ(std::string(out, 8), std::string("1234567\0", 8));
 }
 
-TEST_F(LabelScript, ALongLabelStaysInsideItsBuffer)
+TEST_F(LabelScript, a_long_label_stays_inside_its_buffer)
 {
     for (size_t length : {7U, 8U, 9U}) {
         std::string text(length, 'x');

@@ -3,15 +3,21 @@
 #include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <string>
+#include <vector>
 
 #include "disk/discovery.h"
 #include "disk/mount_table.h"
 #include "fs/fs_type.h"
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/stubs.h"
+#include "support/text.h"
 #include "util/block_dev.h"
 #include "util/exec.h"
 #include "util/file.h"

@@ -32,7 +32,7 @@ std::string made_of_word(const char* format, const char* word)
 
 }  // namespace
 
-TEST(CommandFormat, FillsThePlacesInTheirOrder)
+TEST(CommandFormat, fills_the_places_in_their_order)
 {
     EXPECT_EQ(made("mount > x", {}), "mount > x");
     EXPECT_EQ(made("umount %s", {"/dev/sda1"}), "umount /dev/sda1");
@@ -42,18 +42,18 @@ TEST(CommandFormat, FillsThePlacesInTheirOrder)
     EXPECT_EQ(made("", {}), "");
 }
 
-TEST(CommandFormat, DoesNotFillWhatAWordBrings)
+TEST(CommandFormat, does_not_fill_what_a_word_brings)
 {
     EXPECT_EQ(made("a %s %s", {"%s", "b"}), "a %s b");
 }
 
-TEST(CommandFormat, RefusesWhenAWordIsMissing)
+TEST(CommandFormat, refuses_when_a_word_is_missing)
 {
     EXPECT_EQ(made("%s %s", {"a"}), "refused");
     EXPECT_EQ(made("%s", {}), "refused");
 }
 
-TEST(CommandFormat, IsCutAtOneLessThanItsBuffer)
+TEST(CommandFormat, is_cut_at_one_less_than_its_buffer)
 {
     for (size_t length : {1U, 2U, 3U, 9U}) {
         const std::string word(length, 'w');
@@ -63,13 +63,13 @@ TEST(CommandFormat, IsCutAtOneLessThanItsBuffer)
     EXPECT_EQ(made("abc", {}, 1), "");
 }
 
-TEST(CommandFormat, AWordBehindTheCutIsRefusedToo)
+TEST(CommandFormat, a_word_behind_the_cut_is_refused_too)
 {
     EXPECT_EQ(made("umount %s", {";reboot"}, 8), "refused");
     EXPECT_EQ(made("umount %s %s", {"aaaaaaaa", ";reboot"}, 8), "refused");
 }
 
-TEST(CommandFormat, TakesPlainWords)
+TEST(CommandFormat, takes_plain_words)
 {
     for (const char* word :
          {"/dev/sda1", "/tmp/mountd/disk1_part1", "/", "", "/tmp/a+b,c:d@e%f=g", "/tmp/b\xc3\xbcro",
@@ -78,7 +78,7 @@ TEST(CommandFormat, TakesPlainWords)
     }
 }
 
-TEST(CommandFormat, RefusesWhatAShellWouldReadAndWhatClimbs)
+TEST(CommandFormat, refuses_what_a_shell_would_read_and_what_climbs)
 {
     for (const char* word : {"/dev/sda1;x",   "/tmp/a b",
                              "/tmp/$x",       "/tmp/a\\040b",
@@ -96,7 +96,7 @@ TEST(CommandFormat, RefusesWhatAShellWouldReadAndWhatClimbs)
     }
 }
 
-TEST(CommandFormat, InQuotesRefusesOnlyWhatTheyDoNotHold)
+TEST(CommandFormat, in_quotes_refuses_only_what_they_do_not_hold)
 {
     EXPECT_EQ(made("mkdir -p '%s'", {"a b;$(c)\"`\\"}), "mkdir -p 'a b;$(c)\"`\\'");
     EXPECT_EQ(made("mkdir -p '%s'", {"a'b"}), "refused");
@@ -106,7 +106,7 @@ TEST(CommandFormat, InQuotesRefusesOnlyWhatTheyDoNotHold)
     }
 }
 
-TEST(CommandFormat, QuotesHoldUpToTheirOwnEnd)
+TEST(CommandFormat, quotes_hold_up_to_their_own_end)
 {
     EXPECT_EQ(made("a 'b' %s", {"c d"}), "refused");
     EXPECT_EQ(made("a \"b\" %s", {"c d"}), "refused");
@@ -114,14 +114,14 @@ TEST(CommandFormat, QuotesHoldUpToTheirOwnEnd)
     EXPECT_EQ(made("a '\"%s'", {"c$d"}), "a '\"c$d'");
 }
 
-TEST(CommandOfWord, IsAsLongAsItTakes)
+TEST(CommandOfWord, is_as_long_as_it_takes)
 {
     const std::string word(1000, 'w');
     EXPECT_EQ(made_of_word("mkdir -p '%s'", word.c_str()), "mkdir -p '" + word + "'");
     EXPECT_EQ(made_of_word("mkdir -p '%s'", ""), "mkdir -p ''");
 }
 
-TEST(CommandOfWord, RefusesTheSameWords)
+TEST(CommandOfWord, refuses_the_same_words)
 {
     EXPECT_EQ(made_of_word("mkdir -p '%s'", "a'b"), "refused");
     EXPECT_EQ(made_of_word("rm -rf \"%s\"", "$a"), "refused");

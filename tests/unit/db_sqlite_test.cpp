@@ -3,8 +3,12 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <filesystem>
+#include <string>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/text.h"
 
 using support::contains;
 using support::log_of;
@@ -46,7 +50,7 @@ protected:
 
 }  // namespace
 
-TEST_F(Database, InitClearsTheHandle)
+TEST_F(Database, init_clears_the_handle)
 {
     sqlite_handle dirty;
     memset(&dirty, 0x5A, sizeof(dirty));
@@ -55,7 +59,7 @@ TEST_F(Database, InitClearsTheHandle)
     EXPECT_EQ(dirty.stmt, nullptr);
 }
 
-TEST_F(Database, ANullHandleIsRefused)
+TEST_F(Database, a_null_handle_is_refused)
 {
     EXPECT_EQ(db_handle_init(nullptr), 1);
     EXPECT_EQ(db_open(nullptr, FILE_NAME.c_str()), 1);
@@ -68,7 +72,7 @@ TEST_F(Database, ANullHandleIsRefused)
     });
 }
 
-TEST_F(Database, OpenCreatesTheFile)
+TEST_F(Database, open_creates_the_file)
 {
     std::string log = log_of([&] { open_with_table(); });
     EXPECT_EQ(log, "");
@@ -78,7 +82,7 @@ TEST_F(Database, OpenCreatesTheFile)
     expect_cleared();
 }
 
-TEST_F(Database, ContentOutlastsTheConnection)
+TEST_F(Database, content_outlasts_the_connection)
 {
     open_with_table();
     EXPECT_EQ(db_close(&handle), 0);
@@ -86,7 +90,7 @@ TEST_F(Database, ContentOutlastsTheConnection)
     EXPECT_EQ(db_table_exists(&handle, "disk"), 0);
 }
 
-TEST_F(Database, AFailedOpenIsLoggedAndLeavesTheHandleClosed)
+TEST_F(Database, a_failed_open_is_logged_and_leaves_the_handle_closed)
 {
     std::string log = log_of([&] { EXPECT_EQ(db_open(&handle, "/run/missing/test.db"), 1); });
     expect_cleared();
@@ -94,7 +98,7 @@ TEST_F(Database, AFailedOpenIsLoggedAndLeavesTheHandleClosed)
                        INFO + "sqlite err = unable to open database file\n");
 }
 
-TEST_F(Database, ADirectoryCannotBeOpened)
+TEST_F(Database, a_directory_cannot_be_opened)
 {
     support::make_dir("/run/dir.db");
     std::string log = log_of([&] { EXPECT_EQ(db_open(&handle, "/run/dir.db"), 1); });
@@ -103,13 +107,13 @@ TEST_F(Database, ADirectoryCannotBeOpened)
                        "sqlite err = unable to open database file\n");
 }
 
-TEST_F(Database, ClosingAHandleThatWasNeverOpenedSucceeds)
+TEST_F(Database, closing_a_handle_that_was_never_opened_succeeds)
 {
     std::string log = log_of([&] { EXPECT_EQ(db_close(&handle), 0); });
     EXPECT_EQ(log, "");
 }
 
-TEST_F(Database, CloseFinalizesTheStatement)
+TEST_F(Database, close_finalizes_the_statement)
 {
     open_with_table();
     ASSERT_EQ(db_prepare(&handle, "select * from disk"), 0);
@@ -118,7 +122,7 @@ TEST_F(Database, CloseFinalizesTheStatement)
     expect_cleared();
 }
 
-TEST_F(Database, AFailedCloseIsLoggedAndClearsTheHandleAllTheSame)
+TEST_F(Database, a_failed_close_is_logged_and_clears_the_handle_all_the_same)
 {
     open_with_table();
     sqlite3* connection = handle.db;
@@ -133,7 +137,7 @@ TEST_F(Database, AFailedCloseIsLoggedAndClearsTheHandleAllTheSame)
     EXPECT_EQ(sqlite3_close(connection), SQLITE_OK);
 }
 
-TEST_F(Database, FinalizeWithoutAStatementGivesOneSilently)
+TEST_F(Database, finalize_without_a_statement_gives_one_silently)
 {
     std::string log = log_of([&] {
         EXPECT_EQ(db_finalize(&handle), 1);
@@ -143,7 +147,7 @@ TEST_F(Database, FinalizeWithoutAStatementGivesOneSilently)
     EXPECT_EQ(log, "");
 }
 
-TEST_F(Database, FinalizeEndsTheStatement)
+TEST_F(Database, finalize_ends_the_statement)
 {
     open_with_table();
     ASSERT_EQ(db_prepare(&handle, "select 1"), 0);
@@ -152,7 +156,7 @@ TEST_F(Database, FinalizeEndsTheStatement)
     EXPECT_EQ(db_finalize(&handle), 1);
 }
 
-TEST_F(Database, FinalizeOfAFailedStatementIsLoggedAndClearsIt)
+TEST_F(Database, finalize_of_a_failed_statement_is_logged_and_clears_it)
 {
     open_with_table();
     ASSERT_EQ(db_exec(&handle, "insert into disk values (1, 'a')"), 0);
@@ -167,7 +171,7 @@ TEST_F(Database, FinalizeOfAFailedStatementIsLoggedAndClearsIt)
         << log;
 }
 
-TEST_F(Database, ExecRunsEveryStatementOfTheText)
+TEST_F(Database, exec_runs_every_statement_of_the_text)
 {
     open_with_table();
     EXPECT_EQ(db_exec(&handle, "insert into disk values (1, 'a'); insert into disk values (2, 'b');"
@@ -180,7 +184,7 @@ TEST_F(Database, ExecRunsEveryStatementOfTheText)
     EXPECT_EQ(db_exec(&handle, ""), 0);
 }
 
-TEST_F(Database, ExecWithASyntaxErrorLogsTheLibrarysMessage)
+TEST_F(Database, exec_with_a_syntax_error_logs_the_librarys_message)
 {
     open_with_table();
     std::string log = log_of([&] { EXPECT_EQ(db_exec(&handle, "selekt 1"), 1); });
@@ -189,7 +193,7 @@ TEST_F(Database, ExecWithASyntaxErrorLogsTheLibrarysMessage)
                        "sqlite err = near \"selekt\": syntax error\n");
 }
 
-TEST_F(Database, ExecAndPrepareWithoutConnectionOrTextAreRefused)
+TEST_F(Database, exec_and_prepare_without_connection_or_text_are_refused)
 {
     std::string log = log_of([&] {
         EXPECT_EQ(db_exec(&handle, "select 1"), 1);
@@ -202,7 +206,7 @@ TEST_F(Database, ExecAndPrepareWithoutConnectionOrTextAreRefused)
     EXPECT_EQ(log, line + line + line + line);
 }
 
-TEST_F(Database, APreparedStatementIsDrivenByItsCaller)
+TEST_F(Database, a_prepared_statement_is_driven_by_its_caller)
 {
     open_with_table();
     ASSERT_EQ(db_exec(&handle, "insert into disk values (7, 'abc')"), 0);
@@ -215,7 +219,7 @@ TEST_F(Database, APreparedStatementIsDrivenByItsCaller)
     EXPECT_EQ(db_finalize(&handle), 0);
 }
 
-TEST_F(Database, AFailedPrepareLogsTheStatement)
+TEST_F(Database, a_failed_prepare_logs_the_statement)
 {
     open_with_table();
     std::string log = log_of([&] { EXPECT_EQ(db_prepare(&handle, "select * from nowhere"), 1); });
@@ -224,7 +228,7 @@ TEST_F(Database, AFailedPrepareLogsTheStatement)
     EXPECT_EQ(handle.stmt, nullptr);
 }
 
-TEST_F(Database, ATableExistsOrNot)
+TEST_F(Database, a_table_exists_or_not)
 {
     open_with_table();
     std::string log = log_of([&] {
@@ -237,7 +241,7 @@ TEST_F(Database, ATableExistsOrNot)
     EXPECT_EQ(handle.stmt, nullptr);
 }
 
-TEST_F(Database, AnIndexOrViewIsNoTable)
+TEST_F(Database, an_index_or_view_is_no_table)
 {
     open_with_table();
     ASSERT_EQ(db_exec(&handle, "create view v as select 1; create index i on disk (uuid)"), 0);
@@ -245,20 +249,20 @@ TEST_F(Database, AnIndexOrViewIsNoTable)
     EXPECT_EQ(db_table_exists(&handle, "i"), 1);
 }
 
-TEST_F(Database, OnAClosedHandleTheTableQueryFails)
+TEST_F(Database, on_a_closed_handle_the_table_query_fails)
 {
     std::string log = log_of([&] { EXPECT_EQ(db_table_exists(&handle, "disk"), -1); });
     EXPECT_EQ(log, ERR + "err!\n");
 }
 
-TEST_F(Database, WithoutANameTheTableQueryFails)
+TEST_F(Database, without_a_name_the_table_query_fails)
 {
     open_with_table();
     std::string log = log_of([&] { EXPECT_EQ(db_table_exists(&handle, nullptr), -1); });
     EXPECT_EQ(log, ERR + "err!\n");
 }
 
-TEST_F(Database, ATableNameThatBreaksTheQueryFails)
+TEST_F(Database, a_table_name_that_breaks_the_query_fails)
 {
     open_with_table();
     std::string log = log_of([&] { EXPECT_EQ(db_table_exists(&handle, "a'b"), -1); });
@@ -268,7 +272,7 @@ TEST_F(Database, ATableNameThatBreaksTheQueryFails)
     EXPECT_EQ(support::lines_of(log).back(), ERR + "err!");
 }
 
-TEST_F(Database, AFileThatIsNoDatabaseFailsAtTheFirstQuery)
+TEST_F(Database, a_file_that_is_no_database_fails_at_the_first_query)
 {
     support::write_file(FILE_NAME, std::string(4096, 'x'));
     ASSERT_EQ(db_open(&handle, FILE_NAME.c_str()), 0);
@@ -283,7 +287,7 @@ TEST_F(Database, AFileThatIsNoDatabaseFailsAtTheFirstQuery)
     EXPECT_EQ(support::read_file(FILE_NAME), std::string(4096, 'x'));
 }
 
-TEST_F(Database, ACutDatabaseFailsWithoutHarm)
+TEST_F(Database, a_cut_database_fails_without_harm)
 {
     open_with_table();
     for (int i = 0; i < 50; i++) {
@@ -296,14 +300,14 @@ TEST_F(Database, ACutDatabaseFailsWithoutHarm)
     EXPECT_EQ(db_close(&handle), 0);
 }
 
-TEST_F(Database, TheLastErrorIsLoggedWithCodeAndMessage)
+TEST_F(Database, the_last_error_is_logged_with_code_and_message)
 {
     open_with_table();
     std::string log = log_of([&] { db_log_error(&handle); });
     EXPECT_EQ(log, INFO + "sqlite err code = 0\n" + INFO + "sqlite err = not an error\n");
 }
 
-TEST_F(Database, TextIsBoundAndTakenAsItStands)
+TEST_F(Database, text_is_bound_and_taken_as_it_stands)
 {
     open_with_table();
     const char* const hostile[] = {"it's; drop table disk"};
@@ -314,7 +318,7 @@ TEST_F(Database, TextIsBoundAndTakenAsItStands)
     EXPECT_EQ(db_step_is_one(&handle), 1);
 }
 
-TEST_F(Database, AParameterThatDoesNotExistCannotBeBound)
+TEST_F(Database, a_parameter_that_does_not_exist_cannot_be_bound)
 {
     open_with_table();
     const char* const values[] = {"x"};
@@ -328,7 +332,7 @@ TEST_F(Database, AParameterThatDoesNotExistCannotBeBound)
     EXPECT_EQ(handle.stmt, nullptr);
 }
 
-TEST_F(Database, ABoundStatementThatCannotBePreparedIsToldLikeAnyThatIsExecuted)
+TEST_F(Database, a_bound_statement_that_cannot_be_prepared_is_told_like_any_that_is_executed)
 {
     open_with_table();
     const char* const values[] = {"x"};
@@ -339,7 +343,7 @@ TEST_F(Database, ABoundStatementThatCannotBePreparedIsToldLikeAnyThatIsExecuted)
     EXPECT_EQ(handle.stmt, nullptr);
 }
 
-TEST_F(Database, AFailedPreparationIsToldInTheReadableForm)
+TEST_F(Database, a_failed_preparation_is_told_in_the_readable_form)
 {
     open_with_table();
     const char* const values[] = {"x"};
@@ -354,14 +358,14 @@ TEST_F(Database, AFailedPreparationIsToldInTheReadableForm)
     EXPECT_EQ(log, ERR + "err!\n");
 }
 
-TEST_F(Database, TheErrorOfNoHandleIsNotAsked)
+TEST_F(Database, the_error_of_no_handle_is_not_asked)
 {
     EXPECT_EQ(log_of([] { db_log_error(nullptr); }), "");
     const std::string log = log_of([&] { db_log_error(&handle); });
     EXPECT_TRUE(contains(log, "sqlite err code = ")) << log;
 }
 
-TEST_F(Database, OnlyTheLastValueOfTheLastRowIsComparedWithOne)
+TEST_F(Database, only_the_last_value_of_the_last_row_is_compared_with_one)
 {
     struct {
         const char* query;
@@ -385,7 +389,7 @@ TEST_F(Database, OnlyTheLastValueOfTheLastRowIsComparedWithOne)
     }
 }
 
-TEST_F(Database, AStepThatFailsIsLoggedAndFinalizes)
+TEST_F(Database, a_step_that_fails_is_logged_and_finalizes)
 {
     open_with_table();
     ASSERT_EQ(db_exec(&handle, "insert into disk values (1, 'a')"), 0);

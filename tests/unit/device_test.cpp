@@ -3,8 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::contains;
 using support::log_of;
@@ -33,7 +38,7 @@ private:
 
 }  // namespace
 
-TEST_F(Device, TheModelIsCutToItsBufferAndTheRestIsZero)
+TEST_F(Device, the_model_is_cut_to_its_buffer_and_the_rest_is_zero)
 {
     struct {
         const char* model;
@@ -55,14 +60,14 @@ TEST_F(Device, TheModelIsCutToItsBufferAndTheRestIsZero)
     }
 }
 
-TEST_F(Device, WithoutAModelTheQueryFails)
+TEST_F(Device, without_a_model_the_query_fails)
 {
     char out[8] = "old";
     std::string log = log_of([&] { EXPECT_EQ(device_get_model(out, sizeof(out)), 1); });
     EXPECT_EQ(log, "ERROR[device.cpp:N]err!\n");
 }
 
-TEST_F(Device, EveryModelPassesTheCheck)
+TEST_F(Device, every_model_passes_the_check)
 {
     log_of([] { EXPECT_EQ(device_model_check(), 1); });
     write_file(model_file, "a model text of more than thirty-two characters\n");
@@ -70,7 +75,7 @@ TEST_F(Device, EveryModelPassesTheCheck)
     EXPECT_EQ(log, "device.cpp(N)get model = a model text of more than thirt\n");
 }
 
-TEST_F(Device, TheSdcardPointIsTheLibrarysText)
+TEST_F(Device, the_sdcard_point_is_the_librarys_text)
 {
     write_file(sdcard_file, "1-1.4\n");
     char out[16];
@@ -80,7 +85,7 @@ TEST_F(Device, TheSdcardPointIsTheLibrarysText)
     EXPECT_EQ(log, "device.cpp(N)get sdcard point = 1-1.4\n");
 }
 
-TEST_F(Device, ARouterWithoutAnSdcardSlotGivesAnEmptyPoint)
+TEST_F(Device, a_router_without_an_sdcard_slot_gives_an_empty_point)
 {
     char out[16];
     memset(out, '#', sizeof(out));
@@ -89,13 +94,13 @@ TEST_F(Device, ARouterWithoutAnSdcardSlotGivesAnEmptyPoint)
     EXPECT_EQ(log, "device.cpp(N)get sdcard point = \n");
 }
 
-TEST_F(Device, AMissingBufferForTheSdcardPointFails)
+TEST_F(Device, a_missing_buffer_for_the_sdcard_point_fails)
 {
     std::string log = log_of([] { EXPECT_EQ(device_get_sdcard_point(nullptr, 16), 1); });
     EXPECT_EQ(log, "ERROR[device.cpp:N]err!\n");
 }
 
-TEST(Firewall, IsReloadedByItsInitScript)
+TEST(Firewall, is_reloaded_by_its_init_script)
 {
     support::stub_programs stubs;
     stubs.add_at("/etc/init.d/firewall", "echo noise >&2; exit 1");
@@ -107,13 +112,13 @@ TEST(Firewall, IsReloadedByItsInitScript)
     EXPECT_EQ(errors, "");
 }
 
-TEST(Firewall, AMissingInitScriptIsNoFailure)
+TEST(Firewall, a_missing_init_script_is_no_failure)
 {
     support::remove_all("/etc/init.d/firewall");
     log_of([] { EXPECT_EQ(firewall_reload(), 0); });
 }
 
-TEST(SambaShare, IsPointedAtTheMountBaseAndSambaRestarted)
+TEST(SambaShare, is_pointed_at_the_mount_base_and_samba_restarted)
 {
     support::stub_programs stubs;
     stubs.add("uci", "exit 1");
@@ -127,7 +132,7 @@ TEST(SambaShare, IsPointedAtTheMountBaseAndSambaRestarted)
     EXPECT_TRUE(contains(log, "exec cmd = /etc/init.d/samba restart\n")) << log;
 }
 
-TEST(InitHook, DoesNothing)
+TEST(InitHook, does_nothing)
 {
     EXPECT_EQ(log_of([] { EXPECT_EQ(init_hook(), 0); }), "");
 }

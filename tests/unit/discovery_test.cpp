@@ -1,15 +1,24 @@
 #include "disk/discovery.h"
 
+#include <gtest/gtest.h>
+
+#include <cstdint>
 #include <filesystem>
 #include <string>
 #include <utility>
+#include <vector>
 
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::is_all_zero;
+using support::is_all_zero;
 
 namespace {
 
@@ -20,7 +29,7 @@ std::string ext4_details(const std::string& uuid)
     return "UUID=\"" + uuid + R"(" TYPE="ext4")";
 }
 
-class Discovery : public support_disk::disk_world {
+class Discovery : public support::disk_world {
 protected:
     // A partitioned disk with one ext4 partition of each size, numbered from 1.
     void plug_with_parts(const std::string& disk, const std::vector<uint64_t>& sizes)
@@ -168,7 +177,7 @@ TEST_F(Discovery, a_partition_without_a_disk_is_not_added)
 TEST_F(Discovery, a_partition_of_a_17th_disk_is_not_added)
 {
     for (disk_entry& entry : sets.entries) {
-        support_disk::put_root(&entry, "hda", 1);
+        support::put_root(&entry, "hda", 1);
     }
     plug_with_parts("sdb", {4000});
     const std::string log = capture_stdout([&] { disk_sets_add_dev(&sets, "sdb1"); });
@@ -210,7 +219,7 @@ TEST_F(Discovery, a_ninth_partition_that_arrives_later_is_refused)
     const disk_sets before = sets;
     plug_part("sda", "sda9", ext4_details("U-9"), 9000);
     disk_sets_add_dev(&sets, "sda9");
-    EXPECT_TRUE(support_disk::same_bytes(before, sets));
+    EXPECT_TRUE(support::same_bytes(before, sets));
 }
 
 TEST_F(Discovery, a_whole_disk_with_a_filesystem_has_a_root_type_and_no_slots)
@@ -235,7 +244,7 @@ TEST_F(Discovery, adding_a_name_twice_logs_it_and_changes_nothing)
         EXPECT_TRUE(
             contains(log, std::string("=== ===> dev is already add! dev name = ") + name + "\n"));
     }
-    EXPECT_TRUE(support_disk::same_bytes(before, sets));
+    EXPECT_TRUE(support::same_bytes(before, sets));
 }
 
 TEST_F(Discovery, a_partition_arriving_on_a_known_disk_gets_its_size_and_other_slots_stay)
@@ -271,7 +280,7 @@ TEST_F(Discovery, attribute_entries_of_the_disks_directory_are_no_partitions)
 
 TEST_F(Discovery, a_disk_directory_that_cannot_be_opened_is_named_sys_block_in_the_log)
 {
-    support_disk::put_root(&sets.entries[0], "sdx", 1);
+    support::put_root(&sets.entries[0], "sdx", 1);
     const std::string log = capture_stdout([&] { disk_obj_scan_parts(&sets.entries[0].disk); });
     EXPECT_TRUE(contains(log, "check path = /sys/block/sdx\n"));
     EXPECT_TRUE(contains(log, "open dir err, dir = /sys/block\n"));
@@ -280,7 +289,7 @@ TEST_F(Discovery, a_disk_directory_that_cannot_be_opened_is_named_sys_block_in_t
 TEST_F(Discovery, a_disk_added_after_the_first_mount_pass_is_numbered_at_once)
 {
     sets.sorted_once = 1;
-    support_disk::put_root(&sets.entries[0], "sda", 9000);
+    support::put_root(&sets.entries[0], "sda", 9000);
     sets.entries[0].disk.root.mount_point_num = 1;
     plug_with_parts("sdb", {4000, 3000});
     const std::string log = capture_stdout([&] { disk_sets_add_dev(&sets, "sdb"); });
@@ -311,7 +320,7 @@ TEST_F(Discovery, a_disk_whose_device_path_holds_the_slots_identifier_is_the_sd_
         support::remove_all(entry);
         std::filesystem::create_symlink(place, entry);
     }
-    support::write_file(support_disk::SDCARD_POINT, "/1-3/\n");
+    support::write_file(support::SDCARD_POINT, "/1-3/\n");
     const std::string log = capture_stdout([&] {
         disk_sets_add_dev(&sets, "sda");
         disk_sets_add_dev(&sets, "sdb");

@@ -1,11 +1,21 @@
 #include "disk/disk_db.h"
 
+#include <gtest/gtest.h>
 #include <sys/mount.h>
 
+#include <cstdint>
+#include <cstring>
+#include <filesystem>
 #include <string>
 #include <vector>
 
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
+#include "util/paths.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
@@ -26,7 +36,7 @@ disk_db_record make_record(const char* uid, const char* dev_name, const char* di
     return record;
 }
 
-class DiskDb : public support_disk::disk_world {
+class DiskDb : public support::disk_world {
 protected:
     // All rows in order, "uid|dev_name|disk_name|mount_path|mountd", read past the code under test.
     static std::vector<std::string> rows()
@@ -181,7 +191,7 @@ TEST_F(DiskDb, a_partition_without_a_uuid_finds_no_row)
     add_row("U-1", "sda1", "disk1_part1");
     disk_db_record record{};
     EXPECT_EQ(disk_db_get("", &record), 1);
-    EXPECT_TRUE(support_disk::is_all_zero(record));
+    EXPECT_TRUE(support::is_all_zero(record));
 }
 
 TEST_F(DiskDb, a_uid_in_two_rows_counts_as_absent_is_inserted_a_third_time_and_reads_the_first)

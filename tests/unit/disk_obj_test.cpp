@@ -1,24 +1,32 @@
 #include "disk/disk_obj.h"
 
+#include <gtest/gtest.h>
+
 #include <string>
 
 #include "disk/discovery.h"
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::is_all_zero;
-using support_disk::put_part;
+using support::is_all_zero;
+using support::put_part;
 
 namespace {
 
-class DiskObj : public support_disk::disk_world {
+class DiskObj : public support::disk_world {
 protected:
     DiskObj()
     {
         disk = &entry.disk;
-        support_disk::put_root(&entry, "sda", 50000);
+        support::put_root(&entry, "sda", 50000);
     }
 
     // The device names in slot order, "-" for a free slot.
@@ -102,7 +110,7 @@ TEST_F(DiskObj, a_ninth_partition_is_refused_and_changes_nothing)
         capture_stdout([&] { EXPECT_EQ(disk_obj_add_sub_part(disk, "sda9"), 1); });
     EXPECT_TRUE(contains(log, "sub part full, root dev name = sda, sub dev = sda9\n"));
     EXPECT_TRUE(contains(log, "Warning["));
-    EXPECT_TRUE(support_disk::same_bytes(before, *disk));
+    EXPECT_TRUE(support::same_bytes(before, *disk));
     EXPECT_EQ(slots(), "sda1 sda2 sda3 sda4 sda5 sda6 sda7 sda8");
 }
 

@@ -1,19 +1,27 @@
 #include "disk/disk_sets.h"
 
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <cstring>
 #include <string>
 
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::is_all_zero;
-using support_disk::put_part;
-using support_disk::put_root;
+using support::is_all_zero;
+using support::put_part;
+using support::put_root;
 
 namespace {
 
-class DiskSets : public support_disk::disk_world {
+class DiskSets : public support::disk_world {
 protected:
     void put(int place, const char* name, uint64_t mib)
     {
@@ -66,7 +74,7 @@ TEST_F(DiskSets, a_17th_disk_is_refused_and_leaves_the_table_unchanged)
         capture_stdout([&] { EXPECT_EQ(disk_sets_get_free_entry(&sets), nullptr); });
     EXPECT_TRUE(contains(log, "]disk sets is full\n"));
     EXPECT_TRUE(contains(log, "Warning["));
-    EXPECT_TRUE(support_disk::same_bytes(before, sets));
+    EXPECT_TRUE(support::same_bytes(before, sets));
 }
 
 TEST_F(DiskSets, a_disk_is_found_by_its_exact_root_name_and_dumped)

@@ -1,6 +1,7 @@
 #include "disk/disk_status.h"
 
 #include <cjson/cJSON.h>
+#include <gtest/gtest.h>
 #include <sys/mount.h>
 
 #include <filesystem>
@@ -8,14 +9,21 @@
 #include <set>
 #include <string>
 
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/paths.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
+using support::put_part;
+using support::put_root;
 using support::read_file;
-using support_disk::put_part;
-using support_disk::put_root;
 
 namespace {
 
@@ -55,7 +63,7 @@ const cJSON* array(const cJSON* object, const char* key)
     return item;
 }
 
-class DiskStatus : public support_disk::disk_world {
+class DiskStatus : public support::disk_world {
 protected:
     // A partition as it is once mounted.
     part_info* put_mounted(int place, int slot, const char* dev_name, const char* disk_name)

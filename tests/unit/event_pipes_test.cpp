@@ -1,6 +1,7 @@
 #include "manager/event_pipes.h"
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -11,11 +12,15 @@
 #include <chrono>
 #include <csignal>
 #include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <string>
 
-#include "support/support.h"
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/stubs.h"
+#include "support/text.h"
 #include "util/paths.h"
 
 using support::capture_stdout;
@@ -158,7 +163,7 @@ TEST_F(EventPipes, closing_closes_the_descriptors_and_zeroes_the_record)
     pipes.event.type = EVENT_DISK_ADD;
     EXPECT_EQ(event_pipes_close(&pipes), 0);
     EXPECT_EQ(fcntl(fd, F_GETFD), -1);
-    EXPECT_TRUE(support_disk::is_all_zero(pipes));
+    EXPECT_TRUE(support::is_all_zero(pipes));
     struct stat info {};
     EXPECT_EQ(stat(PIPE_SAFE_REMOVE, &info), 0) << "the pipe itself stays";
 }
@@ -302,7 +307,7 @@ TEST_F(EventPipes, an_over_long_add_line_is_rejected_and_nothing_of_it_becomes_a
         send(PIPE_ADD_REMOVE, "#add:" + std::string(length - 6, 'a') + "\n");
         const std::string log = capture_stdout([&] { EXPECT_EQ(event_receive(&pipes), 0); });
         EXPECT_TRUE(contains(log, ", disk name long\n")) << length;
-        EXPECT_TRUE(support_disk::is_all_zero(pipes.event)) << length;
+        EXPECT_TRUE(support::is_all_zero(pipes.event)) << length;
     }
     send(PIPE_ADD_REMOVE, "#heart_beat\n");
     EXPECT_EQ(event_receive(&pipes), 1);
@@ -434,7 +439,7 @@ TEST_F(EventParse, unknown_and_shortened_keywords_are_bad_messages)
         const std::string log =
             capture_stdout([&] { EXPECT_EQ(event_parse(&pipes, message), 1) << message; });
         EXPECT_TRUE(contains(log, std::string("err event = ") + message + "\n")) << log;
-        EXPECT_TRUE(support_disk::is_all_zero(pipes.event)) << message;
+        EXPECT_TRUE(support::is_all_zero(pipes.event)) << message;
     }
 }
 
@@ -451,7 +456,7 @@ TEST_F(EventParse, a_name_of_32_characters_and_a_newline_is_too_long_and_31_are_
     const std::string log = capture_stdout(
         [&] { EXPECT_EQ(event_parse(&pipes, ("#add:" + name32 + "\n").c_str()), 1); });
     EXPECT_TRUE(contains(log, "err event(#add:" + name32 + "\n), disk name long\n")) << log;
-    EXPECT_TRUE(support_disk::is_all_zero(pipes.event));
+    EXPECT_TRUE(support::is_all_zero(pipes.event));
 
     const std::string name31(31, 'n');
     EXPECT_EQ(event_parse(&pipes, ("#add:" + name31 + "\n").c_str()), 0);

@@ -6,8 +6,15 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <cstdio>
+#include <cstdlib>
+#include <ctime>
+#include <string>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/files.h"
+#include "support/text.h"
 #include "util/pause.h"
 
 using support::capture_stderr;
@@ -42,40 +49,40 @@ void count_child(int)
 
 }  // namespace
 
-TEST(ExecCmd, AttemptsOutsideOneToNineMeanFive)
+TEST(ExecCmd, attempts_outside_one_to_nine_mean_five)
 {
     for (int attempts : {0, 10, -3, 11, 1000}) {
         EXPECT_EQ(tries_for(attempts), 5) << attempts;
     }
 }
 
-TEST(ExecCmd, AttemptsFromOneToNineAreTaken)
+TEST(ExecCmd, attempts_from_one_to_nine_are_taken)
 {
     for (int attempts : {1, 2, 5, 8, 9}) {
         EXPECT_EQ(tries_for(attempts), attempts);
     }
 }
 
-TEST(ExecCmd, PrintsTheCommandWithTheCallersFileAndLine)
+TEST(ExecCmd, prints_the_command_with_the_callers_file_and_line)
 {
     std::string text =
         capture_stdout([] { EXPECT_EQ(exec_cmd("echo done", 1, "src/disk/mount.cpp", 77), 0); });
     EXPECT_EQ(text, "src/disk/mount.cpp(77)exec cmd = echo done\ndone\n");
 }
 
-TEST(ExecCmd, TakesFileAndLineOfItsCallerByItself)
+TEST(ExecCmd, takes_file_and_line_of_its_caller_by_itself)
 {
     const std::string text = support::log_of([] { exec_cmd("true", 1); });
     EXPECT_TRUE(text.ends_with("exec_test.cpp(N)exec cmd = true\n")) << text;
 }
 
-TEST(ExecCmd, APercentSignInACommandIsPrintedAsItStands)
+TEST(ExecCmd, a_percent_sign_in_a_command_is_printed_as_it_stands)
 {
     EXPECT_EQ(capture_stdout([] { exec_cmd("true %s%d", 1, "c.cpp", 1); }),
               "c.cpp(1)exec cmd = true %s%d\n");
 }
 
-TEST(ExecCmd, AnExitCodeIsNoFailure)
+TEST(ExecCmd, an_exit_code_is_no_failure)
 {
     for (const char* command :
          {"false", "exit 1", "exit 127", "exit 255", "no_such_program_here"}) {
@@ -87,7 +94,7 @@ TEST(ExecCmd, AnExitCodeIsNoFailure)
     }
 }
 
-TEST(ExecCmd, ACommandKilledByASignalFailsWithTwoLinesPerAttempt)
+TEST(ExecCmd, a_command_killed_by_a_signal_fails_with_two_lines_per_attempt)
 {
     std::string errors;
     std::string text = capture_stdout([&] {
@@ -99,7 +106,7 @@ TEST(ExecCmd, ACommandKilledByASignalFailsWithTwoLinesPerAttempt)
     EXPECT_EQ(count_of(errors, "err:: "), 2) << errors;
 }
 
-TEST(ExecCmd, StopsAtTheFirstSuccess)
+TEST(ExecCmd, stops_at_the_first_success)
 {
     support::remove_all("/run/tried");
     const char* fails_once = "test -e /run/tried || { touch /run/tried; kill -KILL $$; }";
@@ -111,7 +118,7 @@ TEST(ExecCmd, StopsAtTheFirstSuccess)
     support::remove_all("/run/tried");
 }
 
-TEST(ExecCmd, ACommandThatCannotBeStartedFails)
+TEST(ExecCmd, a_command_that_cannot_be_started_fails)
 {
     constexpr int NOT_TOLD = 3;
     int result = 0;
@@ -134,7 +141,7 @@ TEST(ExecCmd, ACommandThatCannotBeStartedFails)
     EXPECT_EQ(count_of(text, "c.cpp(1)exec cmd = true, ret = -1\n"), 3) << text;
 }
 
-TEST(ExecCmd, ItsOutputStandsBeforeThatOfTheCommand)
+TEST(ExecCmd, its_output_stands_before_that_of_the_command)
 {
     std::string text = capture_stdout([] {
         printf("earlier\n");
@@ -143,14 +150,14 @@ TEST(ExecCmd, ItsOutputStandsBeforeThatOfTheCommand)
     EXPECT_EQ(text, "earlier\nc.cpp(1)exec cmd = echo now\nnow\n");
 }
 
-TEST(RunSystem, GivesTheRawStatus)
+TEST(RunSystem, gives_the_raw_status)
 {
     EXPECT_EQ(run_system("true"), 0);
     EXPECT_EQ(run_system("exit 3"), 3 << 8);
     EXPECT_EQ(run_system("kill -TERM $$"), SIGTERM);
 }
 
-TEST(RunSystem, WorksAlsoWhileChildrenAreIgnored)
+TEST(RunSystem, works_also_while_children_are_ignored)
 {
     EXPECT_EQ(in_child([] {
                   signal(SIGCHLD, SIG_IGN);
@@ -162,7 +169,7 @@ TEST(RunSystem, WorksAlsoWhileChildrenAreIgnored)
               0);
 }
 
-TEST(RunSystem, HoldsTheHandlerBackAndPutsItInAgain)
+TEST(RunSystem, holds_the_handler_back_and_puts_it_in_again)
 {
     EXPECT_EQ(in_child([] {
                   signal(SIGCHLD, count_child);
@@ -176,7 +183,7 @@ TEST(RunSystem, HoldsTheHandlerBackAndPutsItInAgain)
               0);
 }
 
-TEST(RunSystem, PutsTheHandlerBackWithItsFlagsAndMask)
+TEST(RunSystem, puts_the_handler_back_with_its_flags_and_mask)
 {
     EXPECT_EQ(in_child([] {
                   struct sigaction ours {};
@@ -196,7 +203,7 @@ TEST(RunSystem, PutsTheHandlerBackWithItsFlagsAndMask)
               0);
 }
 
-TEST(Pause, LastsItsSecondsAlsoWhenSignalsArrive)
+TEST(Pause, lasts_its_seconds_also_when_signals_arrive)
 {
     EXPECT_EQ(in_child([] {
                   struct sigaction action {};

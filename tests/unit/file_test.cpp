@@ -1,12 +1,24 @@
 #include "util/file.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <filesystem>
+#include <string>
 
+#include "support/capture.h"
 #include "support/files.h"
-#include "support/support.h"
+#include "support/images.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::exists;
 using support::log_of;
@@ -68,7 +80,7 @@ using FifoCreateOpen = Files;
 
 }  // namespace
 
-TEST_F(DirHasEntry, WantsTheWholeName)
+TEST_F(DirHasEntry, wants_the_whole_name)
 {
     make_dir(ROOT + "/sda");
     write_file(ROOT + "/sdb1", "");
@@ -80,13 +92,13 @@ TEST_F(DirHasEntry, WantsTheWholeName)
     }
 }
 
-TEST_F(DirHasEntry, AMissingDirectoryHasNoneAndIsLogged)
+TEST_F(DirHasEntry, a_missing_directory_has_none_and_is_logged)
 {
     std::string log = log_of([&] { EXPECT_EQ(dir_has_entry(missing.c_str(), "sda"), 1); });
     EXPECT_EQ(log, "ERROR[file.cpp:N]open dir err, dir = /run/files/missing\n");
 }
 
-TEST_F(DirHasEntry, ANullArgumentGivesOneSilently)
+TEST_F(DirHasEntry, a_null_argument_gives_one_silently)
 {
     std::string log = log_of([&] {
         EXPECT_EQ(dir_has_entry(nullptr, "sda"), 1);
@@ -95,7 +107,7 @@ TEST_F(DirHasEntry, ANullArgumentGivesOneSilently)
     EXPECT_EQ(log, "");
 }
 
-TEST_F(DirHasEntry, ClosesTheDirectoryOnBothOutcomes)
+TEST_F(DirHasEntry, closes_the_directory_on_both_outcomes)
 {
     int before = dup(STDIN_FILENO);
     close(before);
@@ -109,7 +121,7 @@ TEST_F(DirHasEntry, ClosesTheDirectoryOnBothOutcomes)
     EXPECT_EQ(after, before);
 }
 
-TEST_F(FileGetSize, GivesTheSizeAndThatTheFileExists)
+TEST_F(FileGetSize, gives_the_size_and_that_the_file_exists)
 {
     write_file(file, "12345");
     uint8_t flag = 7;
@@ -118,13 +130,13 @@ TEST_F(FileGetSize, GivesTheSizeAndThatTheFileExists)
     EXPECT_EQ(file_get_size(file.c_str(), nullptr), 5);
 }
 
-TEST_F(FileGetSize, CountsPastFourGigabytes)
+TEST_F(FileGetSize, counts_past_four_gigabytes)
 {
     support::image big(5LL << 30, file);
     EXPECT_EQ(file_get_size(file.c_str(), nullptr), 5LL << 30);
 }
 
-TEST_F(FileGetSize, OfAMissingFileIsZeroWithTheSystemsError)
+TEST_F(FileGetSize, of_a_missing_file_is_zero_with_the_systems_error)
 {
     uint8_t flag = 7;
     std::string log = log_of([&] { EXPECT_EQ(file_get_size(missing.c_str(), &flag), 0); });
@@ -134,7 +146,7 @@ TEST_F(FileGetSize, OfAMissingFileIsZeroWithTheSystemsError)
     log_of([&] { EXPECT_EQ(file_get_size(missing.c_str(), nullptr), 0); });
 }
 
-TEST_F(FileWrite, CreatesAndTruncates)
+TEST_F(FileWrite, creates_and_truncates)
 {
     EXPECT_EQ(file_write(file.c_str(), "long text", 9), 0);
     EXPECT_EQ(read_file(file), "long text");
@@ -144,7 +156,7 @@ TEST_F(FileWrite, CreatesAndTruncates)
     EXPECT_EQ(read_file(file), "");
 }
 
-TEST_F(FileWrite, TakesAnyBytesAndAnyLength)
+TEST_F(FileWrite, takes_any_bytes_and_any_length)
 {
     std::string bytes(300000, '\0');
     bytes[1] = '\xff';
@@ -152,7 +164,7 @@ TEST_F(FileWrite, TakesAnyBytesAndAnyLength)
     EXPECT_EQ(read_file(file), bytes);
 }
 
-TEST_F(FileWrite, AnyOpenFailureIsLoggedInTheSameWords)
+TEST_F(FileWrite, any_open_failure_is_logged_in_the_same_words)
 {
     std::string path = missing + "/file";
     std::string log = log_of([&] {
@@ -163,7 +175,7 @@ TEST_F(FileWrite, AnyOpenFailureIsLoggedInTheSameWords)
                    "file.cpp(N)file not exist, fn = /run/files\n");
 }
 
-TEST_F(FileWrite, AStreamThatTakesNoMoreBytesIsNoFailure)
+TEST_F(FileWrite, a_stream_that_takes_no_more_bytes_is_no_failure)
 {
     FILE* full = fopen("/dev/full", "w");
     ASSERT_NE(full, nullptr);
@@ -174,7 +186,7 @@ TEST_F(FileWrite, AStreamThatTakesNoMoreBytesIsNoFailure)
     EXPECT_EQ(file_write("/dev/full", bytes.data(), 100000), 0);
 }
 
-TEST_F(FileWrite, AStreamGetsAllBytes)
+TEST_F(FileWrite, a_stream_gets_all_bytes)
 {
     FILE* stream = fopen(file.c_str(), "w");
     ASSERT_NE(stream, nullptr);
@@ -185,20 +197,20 @@ TEST_F(FileWrite, AStreamGetsAllBytes)
     EXPECT_EQ(read_file(file), "abcd");
 }
 
-TEST_F(FileAppend, CreatesAndAppends)
+TEST_F(FileAppend, creates_and_appends)
 {
     EXPECT_EQ(file_append(file.c_str(), "one", 3), 0);
     EXPECT_EQ(file_append(file.c_str(), "two", 3), 0);
     EXPECT_EQ(read_file(file), "onetwo");
 }
 
-TEST_F(FileAppend, AnOpenFailureIsLogged)
+TEST_F(FileAppend, an_open_failure_is_logged)
 {
     std::string log = log_of([&] { EXPECT_EQ(file_append(ROOT.c_str(), "x", 1), 1); });
     EXPECT_EQ(log, "ERROR[file.cpp:N]open err, file = /run/files\n");
 }
 
-TEST_F(FdReadFull, WantsExactlyThatManyBytes)
+TEST_F(FdReadFull, wants_exactly_that_many_bytes)
 {
     write_file(file, "12345");
     for (int32_t length : {0, 1, 4, 5, 6}) {
@@ -211,7 +223,7 @@ TEST_F(FdReadFull, WantsExactlyThatManyBytes)
     }
 }
 
-TEST_F(FdReadFull, GoesOnAfterAShortRead)
+TEST_F(FdReadFull, goes_on_after_a_short_read)
 {
     int ends[2];
     ASSERT_EQ(pipe(ends), 0);
@@ -232,13 +244,13 @@ TEST_F(FdReadFull, GoesOnAfterAShortRead)
     waitpid(writer, nullptr, 0);
 }
 
-TEST_F(FdReadFull, ABadDescriptorGivesOne)
+TEST_F(FdReadFull, a_bad_descriptor_gives_one)
 {
     char buffer[4];
     EXPECT_EQ(fd_read_full(-1, buffer, 4), 1);
 }
 
-TEST_F(FileReadAt, ReadsAtTheOffset)
+TEST_F(FileReadAt, reads_at_the_offset)
 {
     write_file(file, "0123456789");
     char buffer[4] = "";
@@ -251,7 +263,7 @@ TEST_F(FileReadAt, ReadsAtTheOffset)
     EXPECT_EQ(read_file(file), "0123456789");
 }
 
-TEST_F(FileReadAt, AMissingPathIsCreatedEmptyWithMode0600AndFailsTheRead)
+TEST_F(FileReadAt, a_missing_path_is_created_empty_with_mode_0600_and_fails_the_read)
 {
     char buffer[4];
     std::string log = log_of([&] { EXPECT_EQ(file_read_at(missing.c_str(), 0, buffer, 4), 1); });
@@ -260,7 +272,7 @@ TEST_F(FileReadAt, AMissingPathIsCreatedEmptyWithMode0600AndFailsTheRead)
     EXPECT_EQ(read_file(missing), "");
 }
 
-TEST_F(FileReadAt, DataThatEndsEarlyFails)
+TEST_F(FileReadAt, data_that_ends_early_fails)
 {
     write_file(file, "0123456789");
     char buffer[8];
@@ -268,7 +280,7 @@ TEST_F(FileReadAt, DataThatEndsEarlyFails)
     EXPECT_EQ(log, "ERROR[file.cpp:N]read err, ret=1, len=3\n");
 }
 
-TEST_F(FileReadAt, ANullArgumentOrAFailedOpenIsLogged)
+TEST_F(FileReadAt, a_null_argument_or_a_failed_open_is_logged)
 {
     char buffer[4];
     std::string log = log_of([&] {
@@ -281,7 +293,7 @@ TEST_F(FileReadAt, ANullArgumentOrAFailedOpenIsLogged)
     EXPECT_FALSE(exists(missing));
 }
 
-TEST_F(FileReadAt, ASeekThatFailsIsLogged)
+TEST_F(FileReadAt, a_seek_that_fails_is_logged)
 {
     ASSERT_EQ(mkfifo(file.c_str(), 0600), 0);
     char buffer[4];
@@ -289,13 +301,13 @@ TEST_F(FileReadAt, ASeekThatFailsIsLogged)
     EXPECT_EQ(log, "ERROR[file.cpp:N]seek err!\n");
 }
 
-TEST_F(FileReadAll, GivesTheContentWithATerminatingZero)
+TEST_F(FileReadAll, gives_the_content_with_a_terminating_zero)
 {
     write_file(file, "line one\nline two\n");
     EXPECT_EQ(whole_file(file), "line one\nline two\n");
 }
 
-TEST_F(FileReadAll, AnEmptyFileGivesTheTerminatingZeroAlone)
+TEST_F(FileReadAll, an_empty_file_gives_the_terminating_zero_alone)
 {
     write_file(file, "");
     char* content = file_read_all(file.c_str());
@@ -304,7 +316,7 @@ TEST_F(FileReadAll, AnEmptyFileGivesTheTerminatingZeroAlone)
     free(content);
 }
 
-TEST_F(FileReadAll, TakesExactly8388607Bytes)
+TEST_F(FileReadAll, takes_exactly_8388607_bytes)
 {
     for (off_t size : {8388606, 8388607}) {
         support::image big(size, file);
@@ -317,7 +329,7 @@ TEST_F(FileReadAll, TakesExactly8388607Bytes)
     }
 }
 
-TEST_F(FileReadAll, RefusesMoreThan8388607Bytes)
+TEST_F(FileReadAll, refuses_more_than_8388607_bytes)
 {
     for (off_t size : {8388608LL, 5LL << 30}) {
         support::image big(size, file);
@@ -326,20 +338,20 @@ TEST_F(FileReadAll, RefusesMoreThan8388607Bytes)
     }
 }
 
-TEST_F(FileReadAll, AMissingFileGivesNothing)
+TEST_F(FileReadAll, a_missing_file_gives_nothing)
 {
     std::string log = log_of([&] { EXPECT_EQ(file_read_all(missing.c_str()), nullptr); });
     EXPECT_EQ(log, "file.cpp(N)file not exist, file = /run/files/missing\n");
 }
 
-TEST_F(FileReadAll, AFileThatCannotBeOpenedGivesNothing)
+TEST_F(FileReadAll, a_file_that_cannot_be_opened_gives_nothing)
 {
     make_socket(file);
     std::string log = log_of([&] { EXPECT_EQ(file_read_all(file.c_str()), nullptr); });
     EXPECT_EQ(log, "file.cpp(N)open file err, file = /run/files/file\n");
 }
 
-TEST_F(FileReadAll, AShortReadGivesNothing)
+TEST_F(FileReadAll, a_short_read_gives_nothing)
 {
     // A directory has a size and no bytes to read.
     write_file(ROOT + "/dir/entry", "");
@@ -352,7 +364,7 @@ TEST_F(FileReadAll, AShortReadGivesNothing)
                        std::to_string(info.st_size) + "\n");
 }
 
-TEST_F(FileReadAll, ClosesTheFile)
+TEST_F(FileReadAll, closes_the_file)
 {
     write_file(file, "x");
     int before = dup(STDIN_FILENO);
@@ -365,7 +377,7 @@ TEST_F(FileReadAll, ClosesTheFile)
     EXPECT_EQ(after, before);
 }
 
-TEST_F(FileReadBuf, ZeroFillsTheBufferAndLeavesNoZeroFromItsSizeOn)
+TEST_F(FileReadBuf, zero_fills_the_buffer_and_leaves_no_zero_from_its_size_on)
 {
     for (size_t length : {0, 2, 7, 8, 9}) {
         const std::string content = std::string("123456789").substr(0, length);
@@ -380,7 +392,7 @@ TEST_F(FileReadBuf, ZeroFillsTheBufferAndLeavesNoZeroFromItsSizeOn)
     }
 }
 
-TEST_F(FileReadBuf, AMissingFileLeavesTheBufferAlone)
+TEST_F(FileReadBuf, a_missing_file_leaves_the_buffer_alone)
 {
     char buffer[4] = "old";
     std::string log = log_of([&] { EXPECT_EQ(file_read_buf(missing.c_str(), buffer, 4), 1); });
@@ -388,7 +400,7 @@ TEST_F(FileReadBuf, AMissingFileLeavesTheBufferAlone)
     EXPECT_STREQ(buffer, "old");
 }
 
-TEST_F(FileReadBuf, AsATextKeepsRoomForItsZero)
+TEST_F(FileReadBuf, as_a_text_keeps_room_for_its_zero)
 {
     for (int length : {6, 7, 8}) {
         const std::string content = std::string("12345678").substr(0, length);
@@ -405,7 +417,7 @@ TEST_F(FileReadBuf, AsATextKeepsRoomForItsZero)
     EXPECT_STREQ(text, "");
 }
 
-TEST_F(FileReadBuf, AFileThatCannotBeOpenedIsLogged)
+TEST_F(FileReadBuf, a_file_that_cannot_be_opened_is_logged)
 {
     make_socket(file);
     char buffer[4] = "old";
@@ -414,7 +426,7 @@ TEST_F(FileReadBuf, AFileThatCannotBeOpenedIsLogged)
     EXPECT_STREQ(buffer, "");
 }
 
-TEST_F(FileDelete, TakesTheFileAway)
+TEST_F(FileDelete, takes_the_file_away)
 {
     write_file(file, "x");
     std::string log = log_of([&] { EXPECT_EQ(file_delete(file.c_str()), 0); });
@@ -422,13 +434,13 @@ TEST_F(FileDelete, TakesTheFileAway)
     EXPECT_FALSE(exists(file));
 }
 
-TEST_F(FileDelete, AMissingFileGivesOneAndTheWarning)
+TEST_F(FileDelete, a_missing_file_gives_one_and_the_warning)
 {
     std::string log = log_of([&] { EXPECT_EQ(file_delete(missing.c_str()), 1); });
     EXPECT_EQ(log, "Warning[file.cpp:N]del err! not exist file = /run/files/missing\n");
 }
 
-TEST_F(FileDelete, AFailedRemovalGivesTheSystemsError)
+TEST_F(FileDelete, a_failed_removal_gives_the_systems_error)
 {
     write_file(ROOT + "/dir/entry", "");
     std::string path = ROOT + "/dir";
@@ -438,13 +450,13 @@ TEST_F(FileDelete, AFailedRemovalGivesTheSystemsError)
     EXPECT_TRUE(exists(path));
 }
 
-TEST_F(FileDelete, ANullPathGivesOneSilently)
+TEST_F(FileDelete, a_null_path_gives_one_silently)
 {
     std::string log = log_of([] { EXPECT_EQ(file_delete(nullptr), 1); });
     EXPECT_EQ(log, "");
 }
 
-TEST_F(DirMake, MakesTheDirectoriesAbove)
+TEST_F(DirMake, makes_the_directories_above)
 {
     std::string path = ROOT + "/a b/c";
     std::string log = log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 0); });
@@ -452,13 +464,13 @@ TEST_F(DirMake, MakesTheDirectoriesAbove)
     EXPECT_TRUE(std::filesystem::is_directory(path));
 }
 
-TEST_F(DirMake, AnExistingDirectoryRunsNothing)
+TEST_F(DirMake, an_existing_directory_runs_nothing)
 {
     std::string log = log_of([] { EXPECT_EQ(dir_make(ROOT.c_str()), 0); });
     EXPECT_EQ(log, "");
 }
 
-TEST_F(DirMake, OnAnExistingRegularFileIsASuccessAndMakesNothing)
+TEST_F(DirMake, on_an_existing_regular_file_is_a_success_and_makes_nothing)
 {
     write_file(file, "content");
     std::string log = log_of([&] { EXPECT_EQ(dir_make(file.c_str()), 0); });
@@ -466,14 +478,14 @@ TEST_F(DirMake, OnAnExistingRegularFileIsASuccessAndMakesNothing)
     EXPECT_EQ(read_file(file), "content");
 }
 
-TEST_F(DirMake, TakesAPathOfAnyLength)
+TEST_F(DirMake, takes_a_path_of_any_length)
 {
     std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
     log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 0); });
     EXPECT_TRUE(std::filesystem::is_directory(path));
 }
 
-TEST_F(DirMake, FailsWhenItsCommandCannotRunToItsEnd)
+TEST_F(DirMake, fails_when_its_command_cannot_run_to_its_end)
 {
     // The shell is killed, also one that gives its process to its only command.
     support::stub_programs stubs;
@@ -484,13 +496,13 @@ TEST_F(DirMake, FailsWhenItsCommandCannotRunToItsEnd)
     EXPECT_EQ(stubs.calls().size(), 1U);
 }
 
-TEST_F(DirMake, APathThatEndsTheQuotesRunsNothing)
+TEST_F(DirMake, a_path_that_ends_the_quotes_runs_nothing)
 {
     std::string path = ROOT + "/x' ; touch /run/harm ; '";
     EXPECT_EQ(log_of([&] { EXPECT_EQ(dir_make(path.c_str()), 1); }), "ERROR[file.cpp:N]err!\n");
 }
 
-TEST_F(FifoCreateOpen, MakesThePipeForItsOwnerAlone)
+TEST_F(FifoCreateOpen, makes_the_pipe_for_its_owner_alone)
 {
     std::string path = ROOT + "/fifo";
     int fd = fifo_create_open(path.c_str());
@@ -499,7 +511,7 @@ TEST_F(FifoCreateOpen, MakesThePipeForItsOwnerAlone)
     close(fd);
 }
 
-TEST_F(FifoCreateOpen, OpensForReadingAndWritingWithoutBlocking)
+TEST_F(FifoCreateOpen, opens_for_reading_and_writing_without_blocking)
 {
     std::string path = ROOT + "/fifo";
     int fd = fifo_create_open(path.c_str());
@@ -522,7 +534,7 @@ TEST_F(FifoCreateOpen, OpensForReadingAndWritingWithoutBlocking)
     close(fd);
 }
 
-TEST_F(FifoCreateOpen, TakesWhateverExistsAtThePath)
+TEST_F(FifoCreateOpen, takes_whatever_exists_at_the_path)
 {
     write_file(file, "plain");
     int fd = fifo_create_open(file.c_str());
@@ -532,7 +544,7 @@ TEST_F(FifoCreateOpen, TakesWhateverExistsAtThePath)
     close(fd);
 }
 
-TEST_F(FifoCreateOpen, FailuresGiveMinusOneAndTheSystemsError)
+TEST_F(FifoCreateOpen, failures_give_minus_one_and_the_systems_error)
 {
     std::string path = missing + "/fifo";
     std::string log = log_of([&] {
@@ -543,7 +555,7 @@ TEST_F(FifoCreateOpen, FailuresGiveMinusOneAndTheSystemsError)
                    "ERROR[file.cpp:N](Is a directory)fopen err:");
 }
 
-TEST_F(Files, PathExistsTellsWhatIsThere)
+TEST_F(Files, path_exists_tells_what_is_there)
 {
     write_file(file, "");
     make_link(missing, ROOT + "/dead_link");

@@ -2,14 +2,23 @@
 // from the failures what is still missing, in the program, its documents and its package.
 #include "util/fs_code.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <array>
+#include <cstdint>
+#include <initializer_list>
+#include <iterator>
 #include <string>
 
 #include "fs/fs_probe.h"
 #include "fs/fs_type.h"
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/images.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::contains;
 
@@ -204,20 +213,20 @@ std::string lacks(const filesystem& row)
 
 }  // namespace
 
-TEST(FilesystemTable, EachRowHasWhatItsFilesystemNeeds)
+TEST(FilesystemTable, each_row_has_what_its_filesystem_needs)
 {
     for (const filesystem& row : FILESYSTEMS) {
         EXPECT_EQ(lacks(row), "") << "is what " << row.name << " lacks";
     }
 }
 
-TEST(FilesystemTable, HasARowForEachExpectation)
+TEST(FilesystemTable, has_a_row_for_each_expectation)
 {
     EXPECT_EQ(std::size(FILESYSTEMS), std::size(EXPECTED));
     EXPECT_EQ(static_cast<size_t>(FS_CODE_COUNT), std::size(EXPECTED));
 }
 
-TEST(FilesystemTable, ANumberThatIsNoCodeHasTheRowOfNone)
+TEST(FilesystemTable, a_number_that_is_no_code_has_the_row_of_none)
 {
     for (const int32_t number : {-1, FS_CODE_COUNT, 1000, INT32_MAX, INT32_MIN}) {
         EXPECT_EQ(&filesystem_of(static_cast<fs_code>(number)), &FILESYSTEMS[FS_NONE]) << number;

@@ -1,11 +1,18 @@
 #include "fs/fs_probe.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <cstring>
+#include <initializer_list>
+#include <string>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/images.h"
+#include "support/text.h"
 
 using support::image;
 using support::log_of;
@@ -74,7 +81,7 @@ fs_code ext_probed(uint32_t compat, uint32_t incompat, uint32_t ro_compat)
 
 }  // namespace
 
-TEST(FsProbe, ABlankDeviceMatchesNothing)
+TEST(FsProbe, a_blank_device_matches_nothing)
 {
     image device(DEVICE_SIZE);
     for (fs_code code : EACH_CODE) {
@@ -83,7 +90,7 @@ TEST(FsProbe, ABlankDeviceMatchesNothing)
     EXPECT_EQ(probed(device), FS_NONE);
 }
 
-TEST(FsProbe, AnEmptyDeviceMatchesNothing)
+TEST(FsProbe, an_empty_device_matches_nothing)
 {
     image device(0);
     for (fs_code code : EACH_CODE) {
@@ -92,7 +99,7 @@ TEST(FsProbe, AnEmptyDeviceMatchesNothing)
     EXPECT_EQ(probed(device), FS_NONE);
 }
 
-TEST(FsProbe, NtfsIsItsOemIdentifierWithFourSpaces)
+TEST(FsProbe, ntfs_is_its_oem_identifier_with_four_spaces)
 {
     struct {
         const char* oem;
@@ -106,7 +113,7 @@ TEST(FsProbe, NtfsIsItsOemIdentifierWithFourSpaces)
     }
 }
 
-TEST(FsProbe, ExfatIsFiveBytesOfItsOemIdentifier)
+TEST(FsProbe, exfat_is_five_bytes_of_its_oem_identifier)
 {
     struct {
         const char* oem;
@@ -120,7 +127,7 @@ TEST(FsProbe, ExfatIsFiveBytesOfItsOemIdentifier)
     }
 }
 
-TEST(FsProbe, FatIsAJumpAndTheFirstSignatureByte)
+TEST(FsProbe, fat_is_a_jump_and_the_first_signature_byte)
 {
     struct {
         int byte0;
@@ -143,7 +150,7 @@ TEST(FsProbe, FatIsAJumpAndTheFirstSignatureByte)
     }
 }
 
-TEST(FsProbe, FatIsFoundWithoutTheLastSignatureByte)
+TEST(FsProbe, fat_is_found_without_the_last_signature_byte)
 {
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x58, 0x90}));
@@ -151,7 +158,7 @@ TEST(FsProbe, FatIsFoundWithoutTheLastSignatureByte)
     EXPECT_EQ(probed(device), 5);
 }
 
-TEST(FsProbe, FatRefusesTheNtfsIdentifier)
+TEST(FsProbe, fat_refuses_the_ntfs_identifier)
 {
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x52, 0x90}) + "NTFS    ");
@@ -160,7 +167,7 @@ TEST(FsProbe, FatRefusesTheNtfsIdentifier)
     EXPECT_EQ(probed(device), 8);
 }
 
-TEST(FsProbe, ExfatComesBeforeFat)
+TEST(FsProbe, exfat_comes_before_fat)
 {
     image device(DEVICE_SIZE);
     device.write_at(0, bytes({0xEB, 0x76, 0x90}) + "EXFAT   ");
@@ -169,7 +176,7 @@ TEST(FsProbe, ExfatComesBeforeFat)
     EXPECT_EQ(probed(device), 10);
 }
 
-TEST(FsProbe, ExtIsItsMagicInLittleEndian)
+TEST(FsProbe, ext_is_its_magic_in_little_endian)
 {
     image device(DEVICE_SIZE);
     device.write_at(1024 + 0x38, bytes({0xEF, 0x53}));
@@ -180,7 +187,7 @@ TEST(FsProbe, ExtIsItsMagicInLittleEndian)
     EXPECT_EQ(probed_for(FS_EXT2, device), 3);
 }
 
-TEST(FsProbe, TheFeatureWordsTellTheMembersOfTheExtFamily)
+TEST(FsProbe, the_feature_words_tell_the_members_of_the_ext_family)
 {
     struct {
         uint32_t compat;
@@ -219,7 +226,7 @@ TEST(FsProbe, TheFeatureWordsTellTheMembersOfTheExtFamily)
     }
 }
 
-TEST(FsProbe, HfsplusIsItsSignatureWithoutTheJournal)
+TEST(FsProbe, hfsplus_is_its_signature_without_the_journal)
 {
     struct {
         const char* signature;
@@ -238,7 +245,7 @@ TEST(FsProbe, HfsplusIsItsSignatureWithoutTheJournal)
     }
 }
 
-TEST(FsProbe, AnotherAttributeByteIsNotTheJournalFlag)
+TEST(FsProbe, another_attribute_byte_is_not_the_journal_flag)
 {
     image device(DEVICE_SIZE);
     device.write_at(1024, "H+");
@@ -246,7 +253,7 @@ TEST(FsProbe, AnotherAttributeByteIsNotTheJournalFlag)
     EXPECT_EQ(probed_for(FS_HFSPLUS, device), 6);
 }
 
-TEST(FsProbe, AnExtendedRecordIsTheSignatureWithoutAJump)
+TEST(FsProbe, an_extended_record_is_the_signature_without_a_jump)
 {
     struct {
         int byte0;
@@ -267,7 +274,7 @@ TEST(FsProbe, AnExtendedRecordIsTheSignatureWithoutAJump)
     }
 }
 
-TEST(FsProbe, AGptHeaderStandsInTheSecondSector)
+TEST(FsProbe, a_gpt_header_stands_in_the_second_sector)
 {
     image device(DEVICE_SIZE);
     device.write_at(512, "EFI PART");
@@ -279,7 +286,7 @@ TEST(FsProbe, AGptHeaderStandsInTheSecondSector)
     EXPECT_EQ(probed_for(FS_EFI, device), 0);
 }
 
-TEST(FsProbe, TheProtectiveRecordOfAGptDiskIsExtended)
+TEST(FsProbe, the_protective_record_of_a_gpt_disk_is_extended)
 {
     image device(DEVICE_SIZE);
     device.write_at(446 + 4, bytes({0xEE}));
@@ -289,7 +296,7 @@ TEST(FsProbe, TheProtectiveRecordOfAGptDiskIsExtended)
     EXPECT_EQ(probed(device), 9);
 }
 
-TEST(FsProbe, AnMbrIsTheWholeSignatureWhateverStandsBefore)
+TEST(FsProbe, an_mbr_is_the_whole_signature_whatever_stands_before)
 {
     struct {
         int byte0;
@@ -308,7 +315,7 @@ TEST(FsProbe, AnMbrIsTheWholeSignatureWhateverStandsBefore)
     }
 }
 
-TEST(FsProbe, OneProbeServesTheWholeExtFamilyAndNoneServesNoFilesystem)
+TEST(FsProbe, one_probe_serves_the_whole_ext_family_and_none_serves_no_filesystem)
 {
     image device(DEVICE_SIZE);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
@@ -319,7 +326,7 @@ TEST(FsProbe, OneProbeServesTheWholeExtFamilyAndNoneServesNoFilesystem)
     EXPECT_EQ(probed_for(static_cast<fs_code>(1000), device), FS_NONE);
 }
 
-TEST(FsProbe, TheOrderDecidesBetweenTwoMatches)
+TEST(FsProbe, the_order_decides_between_two_matches)
 {
     image device(DEVICE_SIZE);
     device.write_at(510, bytes({0x55, 0xAA}));
@@ -337,7 +344,7 @@ TEST(FsProbe, TheOrderDecidesBetweenTwoMatches)
     EXPECT_EQ(probed(device), 8);
 }
 
-TEST(FsProbe, EachProbeNeedsItsWholeRegion)
+TEST(FsProbe, each_probe_needs_its_whole_region)
 {
     struct {
         fs_code code;
@@ -361,7 +368,7 @@ TEST(FsProbe, EachProbeNeedsItsWholeRegion)
     }
 }
 
-TEST(FsProbe, ADeviceShorterThan2048BytesIsProbedByTheOtherTests)
+TEST(FsProbe, a_device_shorter_than_2048_bytes_is_probed_by_the_other_tests)
 {
     image device(1536);
     device.write_at(1024 + 0x38, bytes({0x53, 0xEF}));
@@ -372,7 +379,7 @@ TEST(FsProbe, ADeviceShorterThan2048BytesIsProbedByTheOtherTests)
     EXPECT_EQ(probed(device), 6);
 }
 
-TEST(FsReadAt, ReadsExactlyTheRegion)
+TEST(FsReadAt, reads_exactly_the_region)
 {
     image device(1024);
     device.write_at(500, "0123456789");
@@ -385,7 +392,7 @@ TEST(FsReadAt, ReadsExactlyTheRegion)
     EXPECT_EQ(fs_read_at(open_device.fd, buffer, 1020, 4), 0);
 }
 
-TEST(FsReadAt, AShortReadIsLoggedWithTheBufferAsText)
+TEST(FsReadAt, a_short_read_is_logged_with_the_buffer_as_text)
 {
     image device(1024);
     device.write_at(1021, "xyz");
@@ -399,7 +406,7 @@ TEST(FsReadAt, AShortReadIsLoggedWithTheBufferAsText)
                        ")read err! b = xyz, len = 4\n");
 }
 
-TEST(FsReadAt, AFullBufferOfAShortReadIsPrintedUpToItsLength)
+TEST(FsReadAt, a_full_buffer_of_a_short_read_is_printed_up_to_its_length)
 {
     image device(1024);
     device_fd open_device(device);
@@ -408,7 +415,7 @@ TEST(FsReadAt, AFullBufferOfAShortReadIsPrintedUpToItsLength)
     EXPECT_TRUE(support::contains(log, "read err! b = 1234, len = 4\n")) << log;
 }
 
-TEST(FsReadAt, AFailedSeekIsLogged)
+TEST(FsReadAt, a_failed_seek_is_logged)
 {
     int ends[2];
     ASSERT_EQ(pipe(ends), 0);

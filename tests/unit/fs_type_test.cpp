@@ -1,10 +1,19 @@
 #include "fs/fs_type.h"
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
+#include <cstdint>
 #include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/images.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::contains;
 using support::image;
@@ -76,7 +85,7 @@ protected:
 
 }  // namespace
 
-TEST(FsTypeNames, StandAtTheirCodes)
+TEST(FsTypeNames, stand_at_their_codes)
 {
     for (const filesystem& row : FILESYSTEMS) {
         EXPECT_STREQ(fs_type_names[row.code], row.name);
@@ -84,14 +93,14 @@ TEST(FsTypeNames, StandAtTheirCodes)
     }
 }
 
-TEST(FsTypeNames, ANumberThatIsNoCodeIsNamedLikeNone)
+TEST(FsTypeNames, a_number_that_is_no_code_is_named_like_none)
 {
     for (int32_t number : {-1, FS_CODE_COUNT, 1000, INT32_MAX, INT32_MIN}) {
         EXPECT_STREQ(fs_type_name(static_cast<fs_code>(number)), "ERR FS") << number;
     }
 }
 
-TEST_F(FsType, AProbedTypeIsReportedWithoutBlkid)
+TEST_F(FsType, a_probed_type_is_reported_without_blkid)
 {
     device.write_at(3, "NTFS    ");
     std::string log = log_of([&] { EXPECT_EQ(fs_detect_type(device.path()), 8); });
@@ -101,7 +110,7 @@ TEST_F(FsType, AProbedTypeIsReportedWithoutBlkid)
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(FsType, ADeviceThatCannotBeOpenedIsNoneAndBlkidIsNotAsked)
+TEST_F(FsType, a_device_that_cannot_be_opened_is_none_and_blkid_is_not_asked)
 {
     std::string log;
     std::string errors = support::capture_stderr(
@@ -112,7 +121,7 @@ TEST_F(FsType, ADeviceThatCannotBeOpenedIsNoneAndBlkidIsNotAsked)
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(FsType, AnyExtVolumeEndsWithBlkidsOpinion)
+TEST_F(FsType, any_ext_volume_ends_with_blkids_opinion)
 {
     for (char compat : {'\0', '\4'}) {
         make_ext(compat);
@@ -128,7 +137,7 @@ TEST_F(FsType, AnyExtVolumeEndsWithBlkidsOpinion)
     }
 }
 
-TEST_F(FsType, AnExtVolumeIsNoneWhenBlkidFails)
+TEST_F(FsType, an_ext_volume_is_none_when_blkid_fails)
 {
     make_ext('\4');
     stubs.add("blkid", "exit 2");
@@ -139,7 +148,7 @@ TEST_F(FsType, AnExtVolumeIsNoneWhenBlkidFails)
     EXPECT_EQ(stubs.calls(), lines{"blkid /run/image"});
 }
 
-TEST_F(FsType, BlkidDecidesWhenNoProbeMatches)
+TEST_F(FsType, blkid_decides_when_no_probe_matches)
 {
     answer("/run/image: UUID=\"1\" TYPE=\"ntfs\"\n");
     std::string log = log_of([&] { EXPECT_EQ(fs_detect_type(device.path()), 8); });
@@ -150,7 +159,7 @@ TEST_F(FsType, BlkidDecidesWhenNoProbeMatches)
         << log;
 }
 
-TEST_F(FsType, AJournaledHfsplusVolumeIsNone)
+TEST_F(FsType, a_journaled_hfsplus_volume_is_none)
 {
     device.write_at(1024, "H+");
     device.write_at(1024 + 6, "\x20");
@@ -159,34 +168,34 @@ TEST_F(FsType, AJournaledHfsplusVolumeIsNone)
     EXPECT_EQ(stubs.calls(), lines{"blkid /run/image"});
 }
 
-TEST_F(FsType, AnHfsplusVolumeWithoutAJournalIsFound)
+TEST_F(FsType, an_hfsplus_volume_without_a_journal_is_found)
 {
     device.write_at(1024, "H+");
     EXPECT_EQ(detected(), 6);
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(FsType, AnExtendedContainerIsExtended)
+TEST_F(FsType, an_extended_container_is_extended)
 {
     device.write_at(446, "table");
     device.write_at(510, "\x55\xAA");
     EXPECT_EQ(detected(), 9);
 }
 
-TEST_F(FsType, AWholeGptDiskIsExtended)
+TEST_F(FsType, a_whole_gpt_disk_is_extended)
 {
     device.write_at(510, "\x55\xAA");
     device.write_at(512, "EFI PART");
     EXPECT_EQ(detected(), 9);
 }
 
-TEST_F(FsType, AnUnrecognisedFatVolumeWithSecTypeFirstIsNone)
+TEST_F(FsType, an_unrecognised_fat_volume_with_sec_type_first_is_none)
 {
     answer("/run/image: SEC_TYPE=\"msdos\" UUID=\"12-34\" TYPE=\"vfat\"\n");
     EXPECT_EQ(detected(), 0);
 }
 
-TEST_F(FsType, DetectionOnlyReadsTheDevice)
+TEST_F(FsType, detection_only_reads_the_device)
 {
     device.write_at(3, "EXFAT   ");
     std::string before = support::read_file(device.path());
@@ -194,7 +203,7 @@ TEST_F(FsType, DetectionOnlyReadsTheDevice)
     EXPECT_EQ(support::read_file(device.path()), before);
 }
 
-TEST_F(FsType, DetectionClosesTheDevice)
+TEST_F(FsType, detection_closes_the_device)
 {
     int before = dup(STDIN_FILENO);
     close(before);
@@ -206,7 +215,7 @@ TEST_F(FsType, DetectionClosesTheDevice)
     EXPECT_EQ(after, before);
 }
 
-TEST_F(FsType, TheFirstFourCharactersOfBlkidsTypeDecide)
+TEST_F(FsType, the_first_four_characters_of_blkids_type_decide)
 {
     struct {
         const char* type;
@@ -225,21 +234,21 @@ TEST_F(FsType, TheFirstFourCharactersOfBlkidsTypeDecide)
     }
 }
 
-TEST_F(FsType, TheFirstTypeFieldWins)
+TEST_F(FsType, the_first_type_field_wins)
 {
     EXPECT_EQ(from_blkid("/dev/sda: PTTYPE=\"dos\" TYPE=\"vfat\"\n"), 0);
     EXPECT_EQ(from_blkid("/dev/sda: SEC_TYPE=\"ext2\" TYPE=\"ext3\"\n"), 3);
     EXPECT_EQ(from_blkid("/dev/sda: TYPE=\"ext3\" SEC_TYPE=\"ext2\"\n"), 4);
 }
 
-TEST_F(FsType, UnusableAnswersAreNone)
+TEST_F(FsType, unusable_answers_are_none)
 {
     for (const char* text : {"", "/dev/sda1: UUID=\"1\"\n", "TYPE=", "TYPE=\"", "TYP=\"vfat\""}) {
         EXPECT_EQ(from_blkid(text), 0) << text;
     }
 }
 
-TEST_F(FsType, TheTypeTextIsTakenUpToItsQuote)
+TEST_F(FsType, the_type_text_is_taken_up_to_its_quote)
 {
     answer("/dev/sda1: LABEL=\"a\" TYPE=\"ext4\" PARTUUID=\"p\"\n");
     char out[16] = "";
@@ -249,7 +258,7 @@ TEST_F(FsType, TheTypeTextIsTakenUpToItsQuote)
     EXPECT_FALSE(std::filesystem::exists(SCRATCH));
 }
 
-TEST_F(FsType, TheTypeTextStopsAt15Characters)
+TEST_F(FsType, the_type_text_stops_at_15_characters)
 {
     ASSERT_EQ(FS_TYPE_TEXT_SIZE, 16U);
     for (size_t length : {14U, 15U, 16U, 200U}) {
@@ -264,7 +273,7 @@ TEST_F(FsType, TheTypeTextStopsAt15Characters)
     }
 }
 
-TEST_F(FsType, WithoutATypeTheScratchFileIsDeletedToo)
+TEST_F(FsType, without_a_type_the_scratch_file_is_deleted_too)
 {
     answer("/dev/sda1: UUID=\"1\"\n");
     char out[16] = "";
@@ -273,7 +282,7 @@ TEST_F(FsType, WithoutATypeTheScratchFileIsDeletedToo)
     EXPECT_FALSE(std::filesystem::exists(SCRATCH));
 }
 
-TEST_F(FsType, AMissingScratchFileIsNoType)
+TEST_F(FsType, a_missing_scratch_file_is_no_type)
 {
     stubs.add("blkid", "rm -f /tmp/out.txt");
     char out[16] = "";
@@ -281,7 +290,7 @@ TEST_F(FsType, AMissingScratchFileIsNoType)
     EXPECT_FALSE(contains(log, "del err!")) << log;
 }
 
-TEST_F(FsType, ACommandOfMoreThan127CharactersIsCut)
+TEST_F(FsType, a_command_of_more_than_127_characters_is_cut)
 {
     answer("TYPE=\"vfat\"");
     // "blkid ", " > " and the scratch file are 21 characters.
@@ -296,7 +305,7 @@ TEST_F(FsType, ACommandOfMoreThan127CharactersIsCut)
     support::remove_all("/tmp/out.tx");
 }
 
-TEST_F(FsType, ADeviceHasATypeWhenBlkidNamesOne)
+TEST_F(FsType, a_device_has_a_type_when_blkid_names_one)
 {
     answer("/dev/sda1: TYPE=\"nofs\"\n");
     log_of([] { EXPECT_EQ(dev_has_fs_type("sda1"), 1); });
@@ -307,7 +316,7 @@ TEST_F(FsType, ADeviceHasATypeWhenBlkidNamesOne)
     log_of([] { EXPECT_EQ(dev_has_fs_type("sda1"), 0); });
 }
 
-TEST_F(FsType, TheDevicePathOfThatQueryIsCutAt63Characters)
+TEST_F(FsType, the_device_path_of_that_query_is_cut_at_63_characters)
 {
     answer("TYPE=\"vfat\"");
     std::string name(70, 'a');
@@ -315,7 +324,7 @@ TEST_F(FsType, TheDevicePathOfThatQueryIsCutAt63Characters)
     EXPECT_EQ(stubs.calls(), lines{"blkid " + ("/dev/" + name).substr(0, 63)});
 }
 
-TEST(FsTypeHook, DoesNothing)
+TEST(FsTypeHook, does_nothing)
 {
     EXPECT_EQ(log_of([] {
                   EXPECT_EQ(fs_type_hook(FS_EXT4, "/dev/sda1"), 0);
@@ -324,52 +333,52 @@ TEST(FsTypeHook, DoesNothing)
               "");
 }
 
-TEST_F(RealVolume, Ext2)
+TEST_F(RealVolume, ext2)
 {
     EXPECT_EQ(detected("mkfs.ext2 -q -F"), 3);
 }
 
-TEST_F(RealVolume, Ext3IsTakenForExt2BecauseItsSecTypeComesFirst)
+TEST_F(RealVolume, ext3_is_taken_for_ext2_because_its_sec_type_comes_first)
 {
     EXPECT_EQ(detected("mkfs.ext3 -q -F"), 3);
 }
 
-TEST_F(RealVolume, Ext4)
+TEST_F(RealVolume, ext4)
 {
     EXPECT_EQ(detected("mkfs.ext4 -q -F"), 11);
 }
 
-TEST_F(RealVolume, Ext4WithoutAJournalIsStillBlkidsExt4)
+TEST_F(RealVolume, ext4_without_a_journal_is_still_blkids_ext4)
 {
     EXPECT_EQ(detected("mkfs.ext4 -q -F -O ^has_journal"), 11);
 }
 
-TEST_F(RealVolume, Fat12)
+TEST_F(RealVolume, fat12)
 {
     EXPECT_EQ(detected("mkfs.vfat -F 12 -s 32"), 5);
 }
 
-TEST_F(RealVolume, Fat16)
+TEST_F(RealVolume, fat16)
 {
     EXPECT_EQ(detected("mkfs.vfat -F 16"), 5);
 }
 
-TEST_F(RealVolume, Fat32)
+TEST_F(RealVolume, fat32)
 {
     EXPECT_EQ(detected("mkfs.vfat -F 32 -s 1"), 5);
 }
 
-TEST_F(RealVolume, Exfat)
+TEST_F(RealVolume, exfat)
 {
     EXPECT_EQ(detected("mkfs.exfat"), 10);
 }
 
-TEST_F(RealVolume, Ntfs)
+TEST_F(RealVolume, ntfs)
 {
     EXPECT_EQ(detected("mkntfs -q -F -f"), 8);
 }
 
-TEST_F(RealVolume, NothingKnown)
+TEST_F(RealVolume, nothing_known)
 {
     EXPECT_EQ(detected("true"), 0);
 }

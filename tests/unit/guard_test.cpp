@@ -1,11 +1,10 @@
 #include "util/guard.h"
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 
 #include <cerrno>
 #include <cstring>
-
-#include <gtest/gtest.h>
 
 namespace {
 
@@ -29,7 +28,7 @@ void count_text(char* text)
 
 using counted_text = guard<char*, nullptr, count_text>;
 
-TEST(Guard, GivesBackWhatItHoldsAtTheEndOfItsScope)
+TEST(Guard, gives_back_what_it_holds_at_the_end_of_its_scope)
 {
     int descriptor = -1;
     {
@@ -41,7 +40,7 @@ TEST(Guard, GivesBackWhatItHoldsAtTheEndOfItsScope)
     EXPECT_FALSE(is_open(descriptor));
 }
 
-TEST(Guard, GivesBackNothingWhenItHoldsNothing)
+TEST(Guard, gives_back_nothing_when_it_holds_nothing)
 {
     texts_given_back = 0;
     {
@@ -51,7 +50,7 @@ TEST(Guard, GivesBackNothingWhenItHoldsNothing)
     EXPECT_EQ(texts_given_back, 0);
 }
 
-TEST(Guard, WhatIsReleasedStaysOpen)
+TEST(Guard, what_is_released_stays_open)
 {
     int descriptor = -1;
     {
@@ -63,7 +62,7 @@ TEST(Guard, WhatIsReleasedStaysOpen)
     EXPECT_TRUE(is_open(owner));
 }
 
-TEST(Guard, TakingAnotherThingGivesBackTheFirst)
+TEST(Guard, taking_another_thing_gives_back_the_first)
 {
     texts_given_back = 0;
     {
@@ -75,7 +74,7 @@ TEST(Guard, TakingAnotherThingGivesBackTheFirst)
     EXPECT_EQ(texts_given_back, 2);
 }
 
-TEST(Guard, DescriptorZeroIsSomething)
+TEST(Guard, descriptor_zero_is_something)
 {
     const int saved = fcntl(STDIN_FILENO, F_DUPFD_CLOEXEC, 3);
     fd_guard input(STDIN_FILENO);
@@ -87,7 +86,7 @@ TEST(Guard, DescriptorZeroIsSomething)
     }
 }
 
-TEST(Guard, ClosingAStreamTellsThatTheDiskIsFull)
+TEST(Guard, closing_a_stream_tells_that_the_disk_is_full)
 {
     stream_guard full(fopen("/dev/full", "we"));
     ASSERT_NE(full, nullptr);

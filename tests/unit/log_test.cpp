@@ -3,13 +3,23 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
+#include <cstdint>
+#include <cstdio>
 #include <cstring>
 #include <ctime>
+#include <filesystem>
+#include <sstream>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/files.h"
+#include "support/text.h"
 
 using support::capture_stdout;
 using support::in_child;
@@ -84,7 +94,7 @@ std::vector<std::string> log_files()
 
 }  // namespace
 
-TEST(Log, EachLevelHasItsHeader)
+TEST(Log, each_level_has_its_header)
 {
     errno = ENOENT;
     EXPECT_EQ(printed(LOG_LVL_INFO, "mount.cpp", 12, "hello\n"), "mount.cpp(12)hello\n");
@@ -95,7 +105,7 @@ TEST(Log, EachLevelHasItsHeader)
               "ERROR[mount.cpp:12](No such file or directory)hello\n");
 }
 
-TEST(Log, TheLevelsAreNumberedFromOneToFour)
+TEST(Log, the_levels_are_numbered_from_one_to_four)
 {
     EXPECT_EQ(LOG_LVL_INFO, 1);
     EXPECT_EQ(LOG_LVL_WARN, 2);
@@ -103,14 +113,14 @@ TEST(Log, TheLevelsAreNumberedFromOneToFour)
     EXPECT_EQ(LOG_LVL_ERRNO, 4);
 }
 
-TEST(Log, AnyOtherLevelIsPrintedLikeLevelOne)
+TEST(Log, any_other_level_is_printed_like_level_one)
 {
     for (int32_t level : {0, 5, 7, -1, 1000}) {
         EXPECT_EQ(printed(level, "a.cpp", 3, "x\n"), "a.cpp(3)x\n") << level;
     }
 }
 
-TEST(Log, OnlyTheBaseNameOfTheFileIsPrinted)
+TEST(Log, only_the_base_name_of_the_file_is_printed)
 {
     EXPECT_EQ(printed(1, "/a/b/c.cpp", 1, "x"), "c.cpp(1)x");
     EXPECT_EQ(printed(1, "src/disk/mount.cpp", 1, "x"), "mount.cpp(1)x");
@@ -118,7 +128,7 @@ TEST(Log, OnlyTheBaseNameOfTheFileIsPrinted)
     EXPECT_EQ(printed(1, "ends/", 1, "x"), "(1)x");
 }
 
-TEST(Log, TheArgumentsFillTheCallersFormat)
+TEST(Log, the_arguments_fill_the_callers_format)
 {
     std::string text = capture_stdout([] {
         log_printf(LOG_LVL_WARN, "m.cpp", 9, "dev = %s, n = %d, %llu%%\n", "sda1", -5, 1ULL << 40);
@@ -126,18 +136,18 @@ TEST(Log, TheArgumentsFillTheCallersFormat)
     EXPECT_EQ(text, "Warning[m.cpp:9]dev = sda1, n = -5, 1099511627776%\n");
 }
 
-TEST(Log, APercentSignInAnArgumentIsPrintedAsItStands)
+TEST(Log, a_percent_sign_in_an_argument_is_printed_as_it_stands)
 {
     std::string text = capture_stdout([] { log_printf(1, "m.cpp", 9, "label = %s\n", "50%d%s"); });
     EXPECT_EQ(text, "m.cpp(9)label = 50%d%s\n");
 }
 
-TEST(Log, NoNewlineIsAdded)
+TEST(Log, no_newline_is_added)
 {
     EXPECT_EQ(printed(1, "m.cpp", 1, "no end"), "m.cpp(1)no end");
 }
 
-TEST(Log, HeaderAndFormatTogetherAreCutAt255Characters)
+TEST(Log, header_and_format_together_are_cut_at_255_characters)
 {
     const std::string header = "m.cpp(1)";
     for (size_t length : {254U, 255U, 256U, 300U}) {
@@ -147,7 +157,7 @@ TEST(Log, HeaderAndFormatTogetherAreCutAt255Characters)
     }
 }
 
-TEST(Log, AConversionBehindTheHeadersCutIsNotMade)
+TEST(Log, a_conversion_behind_the_headers_cut_is_not_made)
 {
     const std::string header = "m.cpp(1)";
     std::string fmt(255 - header.size(), 'f');
@@ -155,7 +165,7 @@ TEST(Log, AConversionBehindTheHeadersCutIsNotMade)
     EXPECT_EQ(text, header + fmt);
 }
 
-TEST(Log, TheMessageIsCutAt511Characters)
+TEST(Log, the_message_is_cut_at_511_characters)
 {
     const std::string header = "m.cpp(1)";
     for (size_t length : {510U, 511U, 512U, 2000U}) {
@@ -166,7 +176,7 @@ TEST(Log, TheMessageIsCutAt511Characters)
     }
 }
 
-TEST(Log, TheShortFormsGiveTheirOwnFileAndLine)
+TEST(Log, the_short_forms_give_their_own_file_and_line)
 {
     std::string text = support::log_of([] {
         errno = EACCES;
@@ -181,7 +191,7 @@ TEST(Log, TheShortFormsGiveTheirOwnFileAndLine)
                     "ERROR[log_test.cpp:N](Permission denied)4\n");
 }
 
-TEST(Log, ErrnoIsKept)
+TEST(Log, errno_is_kept)
 {
     for (int32_t level = 1; level <= 4; level++) {
         capture_stdout([&] {
@@ -192,7 +202,7 @@ TEST(Log, ErrnoIsKept)
     }
 }
 
-TEST(Log, ErrnoIsKeptWhenStandardOutputIsClosed)
+TEST(Log, errno_is_kept_when_standard_output_is_closed)
 {
     EXPECT_EQ(in_child([] {
                   setvbuf(stdout, nullptr, _IONBF, 0);
@@ -204,19 +214,19 @@ TEST(Log, ErrnoIsKeptWhenStandardOutputIsClosed)
               0);
 }
 
-TEST(Log, SwitchingTheLogOnLeavesItOn)
+TEST(Log, switching_the_log_on_leaves_it_on)
 {
     log_set_debug();
     EXPECT_EQ(printed(1, "m.cpp", 1, "x\n"), "m.cpp(1)x\n");
 }
 
-TEST(Log, PrintingWithoutHeaderTakesTheFormatAlone)
+TEST(Log, printing_without_header_takes_the_format_alone)
 {
     EXPECT_EQ(capture_stdout([] { log_print_stdout("%s(%d)line\n", "a/b.cpp", 7); }),
               "a/b.cpp(7)line\n");
 }
 
-TEST(Log, AReaderThatWentAwayDoesNotSilenceTheLogForTheNextOne)
+TEST(Log, a_reader_that_went_away_does_not_silence_the_log_for_the_next_one)
 {
     const int result = in_child([] {
         signal(SIGPIPE, SIG_IGN);
@@ -237,7 +247,7 @@ TEST(Log, AReaderThatWentAwayDoesNotSilenceTheLogForTheNextOne)
     EXPECT_EQ(result, 0);
 }
 
-TEST(Log, NothingReachesSyslogBeforeItIsSwitchedOn)
+TEST(Log, nothing_reaches_syslog_before_it_is_switched_on)
 {
     syslog_socket sink;
     printed(LOG_LVL_ERR, "m.cpp", 1, "quiet\n");
@@ -249,7 +259,7 @@ protected:
     ~LogToSyslog() override { log_reset(); }
 };
 
-TEST_F(LogToSyslog, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
+TEST_F(LogToSyslog, after_the_switch_every_message_goes_to_syslog_as_tarndisk)
 {
     syslog_socket sink;
     std::string text = capture_stdout([] {
@@ -280,7 +290,7 @@ TEST_F(LogToSyslog, AfterTheSwitchEveryMessageGoesToSyslogAsTarndisk)
     EXPECT_EQ(support::lines_of(text).size(), 5U);
 }
 
-TEST_F(LogToSyslog, AMissingSyslogDisturbsNothing)
+TEST_F(LogToSyslog, a_missing_syslog_disturbs_nothing)
 {
     support::remove_all("/dev/log");
     std::string text = capture_stdout([] {
@@ -304,7 +314,7 @@ protected:
     }
 };
 
-TEST_F(LogFile, IsNamedAfterTheTimeWithoutLeadingZeros)
+TEST_F(LogFile, is_named_after_the_time_without_leading_zeros)
 {
     support::make_dir("/tmp/log");
     time_t before = time(nullptr);
@@ -316,7 +326,7 @@ TEST_F(LogFile, IsNamedAfterTheTimeWithoutLeadingZeros)
         << files[0];
 }
 
-TEST_F(LogFile, ALinkUnderItsNameIsNotFollowed)
+TEST_F(LogFile, a_link_under_its_name_is_not_followed)
 {
     support::make_dir("/tmp/log");
     const time_t now = time(nullptr);
@@ -327,7 +337,7 @@ TEST_F(LogFile, ALinkUnderItsNameIsNotFollowed)
     EXPECT_FALSE(std::filesystem::exists("/tmp/log/victim"));
 }
 
-TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
+TEST_F(LogFile, opening_without_its_directory_fails_and_says_so)
 {
     std::string text = capture_stdout([] { EXPECT_EQ(log_file_open(), 1); });
     EXPECT_TRUE(support::matches(text, "err, file = /tmp/log/disk_log-[0-9]+(-[0-9]+){5}\\.txt\n"))
@@ -335,7 +345,7 @@ TEST_F(LogFile, OpeningWithoutItsDirectoryFailsAndSaysSo)
     EXPECT_FALSE(std::filesystem::exists("/tmp/log"));
 }
 
-TEST_F(LogFile, ClosingSucceedsWhetherOrNotItIsOpen)
+TEST_F(LogFile, closing_succeeds_whether_or_not_it_is_open)
 {
     EXPECT_EQ(log_file_close(), 0);
     support::make_dir("/tmp/log");
@@ -344,7 +354,7 @@ TEST_F(LogFile, ClosingSucceedsWhetherOrNotItIsOpen)
     log_reset();
 }
 
-TEST_F(LogFile, MessagesDoNotReachTheFile)
+TEST_F(LogFile, messages_do_not_reach_the_file)
 {
     support::make_dir("/tmp/log");
     capture_stdout([] {
@@ -357,7 +367,7 @@ TEST_F(LogFile, MessagesDoNotReachTheFile)
     EXPECT_EQ(support::read_file(log_files()[0]), "");
 }
 
-TEST_F(LogFile, WritingOpensTheFileAndStandsInItAtOnce)
+TEST_F(LogFile, writing_opens_the_file_and_stands_in_it_at_once)
 {
     support::make_dir("/tmp/log");
     EXPECT_EQ(log_file_write("one\n"), 0);
@@ -365,12 +375,12 @@ TEST_F(LogFile, WritingOpensTheFileAndStandsInItAtOnce)
     EXPECT_EQ(support::read_file(log_files().at(0)), "one\ntwo");
 }
 
-TEST_F(LogFile, WritingWithoutItsDirectoryIsRefused)
+TEST_F(LogFile, writing_without_its_directory_is_refused)
 {
     capture_stdout([] { EXPECT_EQ(log_file_write("x\n"), 1); });
 }
 
-TEST_F(LogFile, AnExistingFileIsAppendedTo)
+TEST_F(LogFile, an_existing_file_is_appended_to)
 {
     support::make_dir("/tmp/log");
     time_t now = time(nullptr);
@@ -385,7 +395,7 @@ TEST_F(LogFile, AnExistingFileIsAppendedTo)
     EXPECT_EQ(appended, 1);
 }
 
-TEST_F(LogFile, The1502ndWriteIsRefusedAndWritesNothing)
+TEST_F(LogFile, the_1502nd_write_is_refused_and_writes_nothing)
 {
     support::make_dir("/tmp/log");
     for (int i = 1; i <= 1501; i++) {
@@ -399,7 +409,7 @@ TEST_F(LogFile, The1502ndWriteIsRefusedAndWritesNothing)
     EXPECT_EQ(support::count_of(text, "y"), 0);
 }
 
-TEST_F(LogFile, TheResetSwitchesSyslogOffAndCountsLinesAnew)
+TEST_F(LogFile, the_reset_switches_syslog_off_and_counts_lines_anew)
 {
     support::make_dir("/tmp/log");
     syslog_socket sink;

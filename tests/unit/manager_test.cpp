@@ -1,25 +1,38 @@
 #include "manager/manager.h"
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
+#include <cstdint>
+#include <cstring>
 #include <ctime>
+#include <filesystem>
 #include <string>
+#include <vector>
 
 #include "disk/disk_db.h"
 #include "main/signals.h"
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/clock.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/paths.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
+using support::expect_in_child;
+using support::fake_clock;
 using support::read_file;
+using support::the_clock;
 using support::write_file;
-using support_disk::expect_in_child;
-using support_disk::fake_clock;
-using support_disk::the_clock;
 
 namespace {
 
@@ -43,7 +56,7 @@ std::vector<std::string> joined(const std::vector<std::vector<std::string>>& lis
     return all;
 }
 
-class Manager : public support_disk::disk_world {
+class Manager : public support::disk_world {
 protected:
     Manager() : manager(manager_get()) { EXPECT_EQ(manager_init(manager), 0); }
     ~Manager() override { manager_free(manager); }
@@ -96,7 +109,7 @@ TEST_F(Manager, initialising_zeroes_everything_and_opens_the_pipes)
     manager->update_due = 1;
     ASSERT_EQ(manager_init(manager), 0);
     EXPECT_EQ(manager->state, 1);
-    EXPECT_TRUE(support_disk::is_all_zero(manager->disks));
+    EXPECT_TRUE(support::is_all_zero(manager->disks));
     EXPECT_EQ(manager->t_rescan, 0);
     EXPECT_EQ(manager->update_due, 0);
     EXPECT_GT(manager->pipes.fd_add_remove, 0);
@@ -175,7 +188,7 @@ TEST_F(Manager, a_start_with_disks_mounts_and_publishes_them)
 TEST_F(Manager, a_scan_that_cannot_read_the_kernels_list_answers_1)
 {
     const std::string log = expect_in_child([&] {
-        support_disk::allow_no_open_files();
+        support::allow_no_open_files();
         EXPECT_EQ(manager_scan(manager, 0), 1);
         EXPECT_EQ(manager->state, 1);
     });
@@ -343,7 +356,7 @@ TEST_F(Manager, a_calm_cycle_does_nothing)
 TEST_F(Manager, sizes_are_refreshed_after_more_than_4_seconds)
 {
     make_calm();
-    support_disk::put_root(&manager->disks.entries[0], "sda", 0);
+    support::put_root(&manager->disks.entries[0], "sda", 0);
     plug_disk("sda", "", 5000);
     manager->t_update = NOW + 10;
     manager->t_rescan = NOW + 10;
@@ -461,13 +474,13 @@ TEST_F(Manager, two_devices_on_one_path_delete_the_database_and_ask_for_a_restar
 TEST_F(Manager, 61_seconds_of_silence_with_the_companion_running_warn_and_go_on)
 {
     const std::string log = capture_stdout([&] {
-        write_file(support_disk::PIDS_FILE, "321 322\n");
+        write_file(support::PIDS_FILE, "321 322\n");
         the_clock.step = 61;
         the_clock.on_look = [&](int look) {
             if (look == 2) {
                 send("#heart_beat\n");
             } else if (look == 3) {
-                support::remove_all(support_disk::PIDS_FILE);
+                support::remove_all(support::PIDS_FILE);
             }
         };
         EXPECT_EQ(manager_event_loop(manager), 0);

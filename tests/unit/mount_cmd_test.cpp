@@ -3,8 +3,16 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::contains;
 using support::log_of;
@@ -25,21 +33,21 @@ std::string filled_in(const char* format, const char* device, const char* direct
 
 }  // namespace
 
-TEST(MountCommand, IsThatOfTheFilesystemsRow)
+TEST(MountCommand, is_that_of_the_filesystems_row)
 {
     for (const filesystem& row : FILESYSTEMS) {
         EXPECT_STREQ(fs_mount_cmd_format(row.code), row.mount) << row.name;
     }
 }
 
-TEST(MountCommand, NumbersThatAreNoCodeHaveNone)
+TEST(MountCommand, numbers_that_are_no_code_have_none)
 {
     for (int32_t number : {FS_CODE_COUNT, -1, 1000, INT32_MAX, INT32_MIN}) {
         EXPECT_EQ(fs_mount_cmd_format(static_cast<fs_code>(number)), nullptr) << number;
     }
 }
 
-TEST(MountCommand, ASpaceInAnArgumentMakesTwoShellWords)
+TEST(MountCommand, a_space_in_an_argument_makes_two_shell_words)
 {
     support::stub_programs stubs;
     stubs.add("mount", "echo $# >/run/words");
@@ -52,7 +60,7 @@ TEST(MountCommand, ASpaceInAnArgumentMakesTwoShellWords)
     support::remove_all("/run/words");
 }
 
-TEST(RepairCommand, EachFamilyRunsItsChecker)
+TEST(RepairCommand, each_family_runs_its_checker)
 {
     struct {
         int (*repair)(const char*);
@@ -74,7 +82,7 @@ TEST(RepairCommand, EachFamilyRunsItsChecker)
     }
 }
 
-TEST(RepairCommand, OfATypeWithoutOneRunsNothing)
+TEST(RepairCommand, of_a_type_without_one_runs_nothing)
 {
     const std::string log = log_of([] {
         EXPECT_EQ(fs_repair(FS_HFSPLUS, "/dev/sda1"), 1);
@@ -84,7 +92,7 @@ TEST(RepairCommand, OfATypeWithoutOneRunsNothing)
     EXPECT_EQ(log, "");
 }
 
-TEST(RepairCommand, ACommandThatIsKilledIsTriedOnceAndGivesZero)
+TEST(RepairCommand, a_command_that_is_killed_is_tried_once_and_gives_zero)
 {
     support::stub_programs stubs;
     stubs.add("ntfsfix", "kill -KILL $$");
@@ -92,7 +100,7 @@ TEST(RepairCommand, ACommandThatIsKilledIsTriedOnceAndGivesZero)
     EXPECT_EQ(stubs.calls(), lines{"ntfsfix x"});
 }
 
-TEST(RepairCommand, IsCutAt127Characters)
+TEST(RepairCommand, is_cut_at_127_characters)
 {
     for (size_t length : {118U, 119U, 120U}) {
         support::stub_programs stubs;
@@ -103,7 +111,7 @@ TEST(RepairCommand, IsCutAt127Characters)
     }
 }
 
-TEST(RepairCommand, OfANameThatAShellWouldReadRunsNothing)
+TEST(RepairCommand, of_a_name_that_a_shell_would_read_runs_nothing)
 {
     const std::string log =
         log_of([] { EXPECT_EQ(fs_repair_fat("/dev/sda1;touch /run/harm"), 0); });
@@ -124,7 +132,7 @@ protected:
     const std::string dir = "/tmp/mountd";
 };
 
-TEST_F(UmountDirEntries, UnmountsEveryEntryThatIsNotHidden)
+TEST_F(UmountDirEntries, unmounts_every_entry_that_is_not_hidden)
 {
     support::make_dir(dir + "/disk1_part1");
     support::make_dir(dir + "/disk2_part1");
@@ -137,7 +145,7 @@ TEST_F(UmountDirEntries, UnmountsEveryEntryThatIsNotHidden)
     EXPECT_TRUE(contains(log, "exec cmd = umount /tmp/mountd/disk1_part1\n")) << log;
 }
 
-TEST_F(UmountDirEntries, NamesThatAShellWouldReadReachNoCommand)
+TEST_F(UmountDirEntries, names_that_a_shell_would_read_reach_no_command)
 {
     support::make_dir(dir + "/$(touch harm)");
     support::make_dir(dir + "/disk1_part1");
@@ -146,7 +154,7 @@ TEST_F(UmountDirEntries, NamesThatAShellWouldReadReachNoCommand)
     EXPECT_TRUE(contains(log, "umount err, target = /tmp/mountd/$(touch harm)\n")) << log;
 }
 
-TEST_F(UmountDirEntries, OfAnEmptyDirectoryRunsNothing)
+TEST_F(UmountDirEntries, of_an_empty_directory_runs_nothing)
 {
     support::make_dir(dir);
     std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 0); });
@@ -154,14 +162,14 @@ TEST_F(UmountDirEntries, OfAnEmptyDirectoryRunsNothing)
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(UmountDirEntries, OfAMissingDirectoryFails)
+TEST_F(UmountDirEntries, of_a_missing_directory_fails)
 {
     std::string log = log_of([&] { EXPECT_EQ(umount_dir_entries(dir.c_str()), 1); });
     EXPECT_EQ(log, "ERROR[mount_cmd.cpp:N]open dir err, dir = /tmp/mountd\n");
     EXPECT_TRUE(stubs.calls().empty());
 }
 
-TEST_F(UmountDirEntries, CutsItsCommandAt255Characters)
+TEST_F(UmountDirEntries, cuts_its_command_at_255_characters)
 {
     // "umount /tmp/mountd/" is 19 characters.
     std::string name(250, 'a');

@@ -1,20 +1,28 @@
 #include "disk/mount_point.h"
 
+#include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <string>
+#include <vector>
 
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::put_part;
-using support_disk::put_root;
+using support::put_part;
+using support::put_root;
 
 namespace {
 
-class MountPoint : public support_disk::disk_world {
+class MountPoint : public support::disk_world {
 protected:
     // Disks in use in entries 0.. with these numbers; 0 stands for the disk that is being added.
     void put_numbers(const std::vector<int>& numbers)
@@ -37,7 +45,7 @@ void mount_numbers(int first, int last)
         listing += "/dev/sdz" + std::to_string(i) + " on /tmp/mountd/disk" + std::to_string(i) +
                    "_part1 type ext4 (rw)\n";
     }
-    support::write_file(support_disk::MOUNTS_FILE, listing);
+    support::write_file(support::MOUNTS_FILE, listing);
 }
 
 }  // namespace
@@ -76,7 +84,7 @@ TEST_F(MountPoint, a_number_under_which_something_is_mounted_is_not_given)
     };
     for (const auto& c : cases) {
         put_numbers(c.present);
-        support::remove_all(support_disk::MOUNTS_FILE);
+        support::remove_all(support::MOUNTS_FILE);
         add_mount("/dev/sdq1", c.mounted);
         EXPECT_EQ(get_mount_point_num(&sets), c.expected) << c.mounted;
     }
@@ -116,7 +124,7 @@ TEST_F(MountPoint, numbering_all_disks_follows_the_table_and_passes_over_mounted
     EXPECT_EQ(sets.entries[4].disk.root.mount_point_num, 5);
     EXPECT_EQ(sets.entries[3].disk.parts[1].part.mount_point_num, 2);
     EXPECT_TRUE(contains(log, "=== ===> set[3] mount point num = 4\n"));
-    EXPECT_TRUE(support_disk::is_all_zero(sets.entries[1]));
+    EXPECT_TRUE(support::is_all_zero(sets.entries[1]));
     EXPECT_EQ(times_called("mount"), 1) << "one snapshot for all";
 }
 
@@ -153,7 +161,7 @@ TEST_F(MountPoint, part_numbers_follow_the_slots_and_start_at_2_behind_a_whole_d
 
 TEST_F(MountPoint, a_part_that_is_mounted_already_takes_over_its_path_and_name)
 {
-    part_info part = support_disk::make_part("sda1", 2000);
+    part_info part = support::make_part("sda1", 2000);
     EXPECT_EQ(check_part_mounted(&part), 0);
     EXPECT_STREQ(part.mount_path, "");
     add_mount("/dev/sda1", "/tmp/mountd/disk3_part2");

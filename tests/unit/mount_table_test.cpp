@@ -1,16 +1,26 @@
 #include "disk/mount_table.h"
 
-#include <string>
+#include <gtest/gtest.h>
 
-#include "support_disk/disk_world.h"
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <string>
+#include <vector>
+
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/records.h"
+#include "support/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::is_all_zero;
+using support::is_all_zero;
 
 namespace {
 
-class MountTable : public support_disk::disk_world {
+class MountTable : public support::disk_world {
 protected:
     mount_table table{};
 };

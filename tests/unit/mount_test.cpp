@@ -1,26 +1,38 @@
 #include "disk/mount.h"
 
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 
+#include <cstdint>
+#include <filesystem>
 #include <string>
+#include <vector>
 
 #include "disk/discovery.h"
 #include "disk/disk_db.h"
+#include "disk/disk_sets.h"
 #include "disk/mount_point.h"
 #include "disk/removal.h"
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/clock.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/paths.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::put_part;
-using support_disk::put_root;
+using support::put_part;
+using support::put_root;
 
 namespace {
 
 constexpr char TABLE_DETAILS[] = R"(PTUUID="12345678" PTTYPE="dos")";
 
-class Mount : public support_disk::disk_world {
+class Mount : public support::disk_world {
 protected:
     // A numbered disk with one ext4 partition in slot 0, ready to be mounted.
     part_info* put_ready_part(int place, int disk_number, const char* uid)
@@ -62,7 +74,7 @@ protected:
         plug_part(disk, disk + "1", "UUID=\"" + uuid + R"(" TYPE="ext4")", mib);
     }
 
-    support_disk::skipped_sleeps no_sleep;
+    support::skipped_sleeps no_sleep;
     disk_sets sets{};
 };
 
@@ -82,7 +94,7 @@ TEST_F(Mount, a_partition_is_mounted_in_its_directory_with_its_filesystems_comma
     ASSERT_EQ(stat("/tmp/mountd/disk3_part2", &info), 0);
     EXPECT_EQ(info.st_mode & 0666U, 0666U);
     EXPECT_EQ(remembered("U-1"), "sda1 disk3_part2 /tmp/mountd/disk3_part2 yes");
-    EXPECT_EQ(support_disk::the_clock.slept, 2) << "one pause before the first look";
+    EXPECT_EQ(support::the_clock.slept, 2) << "one pause before the first look";
     EXPECT_TRUE(contains(log, "*** *** *** mount part, status = 0\n"));
     EXPECT_EQ(support::count_of(log, "mout path = /tmp/mountd/disk3_part2\n"), 2);
     EXPECT_TRUE(contains(log, "mount OK, /dev/sda1 ==> /tmp/mountd/disk3_part2\n"));
@@ -163,33 +175,33 @@ TEST_F(Mount, an_unknown_filesystem_stays_unmounted_and_gets_no_directory)
 
 TEST_F(Mount, a_mount_that_never_appears_is_given_up_after_nine_looks_and_18_seconds)
 {
-    support::write_file(support_disk::MOUNT_REFUSES, "");
+    support::write_file(support::MOUNT_REFUSES, "");
     part_info* part = put_ready_part(0, 1, "U-1");
     const std::string log = capture_stdout([&] { mount_part(part); });
     EXPECT_EQ(part->mount_status, 0);
-    EXPECT_EQ(support_disk::the_clock.slept, 18);
+    EXPECT_EQ(support::the_clock.slept, 18);
     EXPECT_TRUE(contains(log, "]=== === === mount ERROR, /dev/sda1 ==> /tmp/mountd/disk1_part1\n"));
     EXPECT_TRUE(std::filesystem::exists("/tmp/mountd/disk1_part1"));
     EXPECT_EQ(remembered("U-1"), "sda1 disk1_part1 /tmp/mountd/disk1_part1 yes");
 
-    support::remove_all(support_disk::MOUNT_REFUSES);
+    support::remove_all(support::MOUNT_REFUSES);
     mount_part(part);
     EXPECT_EQ(part->mount_status, 1) << "the next pass tries again";
 }
 
 TEST_F(Mount, a_mount_that_appears_late_is_waited_for)
 {
-    support::write_file(support_disk::MOUNT_REFUSES, "");
+    support::write_file(support::MOUNT_REFUSES, "");
     part_info* part = put_ready_part(0, 1, "U-1");
     int sleeps = 0;
-    support_disk::the_clock.on_sleep = [&] {
+    support::the_clock.on_sleep = [&] {
         if (++sleeps == 9) {
             add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
         }
     };
     mount_part(part);
     EXPECT_EQ(part->mount_status, 1);
-    EXPECT_EQ(support_disk::the_clock.slept, 18);
+    EXPECT_EQ(support::the_clock.slept, 18);
 }
 
 TEST_F(Mount, without_a_row_the_new_name_is_kept_and_stored)
@@ -252,7 +264,7 @@ TEST_F(Mount, a_remembered_path_that_is_not_ours_is_overwritten_and_reaches_no_c
     for (const char* path : {"/etc", "/tmp/mountd", "/tmp/mountd/../etc", "/tmp/mountdisk/x",
                              "/tmp/mountd/x;touch /run/harm", "/tmp/mountd/a/b", ""}) {
         support::remove_all(DISK_DB_FILE);
-        support::remove_all(support_disk::MOUNTS_FILE);
+        support::remove_all(support::MOUNTS_FILE);
         remember("U-1", "sda1", "disk4_part2");
         sqlite3* db = nullptr;
         ASSERT_EQ(sqlite3_open(DISK_DB_FILE, &db), SQLITE_OK);
@@ -291,7 +303,7 @@ TEST_F(Mount, the_longest_remembered_name_stands_whole_in_the_command_and_a_long
     const std::string longest = "/tmp/mountd/" + std::string(MOUNT_NAME_SIZE - 1, 'x');
     text_copy(record.mount_path, longest.c_str());
     disk_db_add(&record);
-    support::write_file(support_disk::MOUNT_REFUSES, "");
+    support::write_file(support::MOUNT_REFUSES, "");
     const std::string command =
         "exec cmd = mount -t vfat -o rw,uid=1000,gid=1000,iocharset=utf8 /dev/sda1 ";
     std::string log = capture_stdout([&] { mount_part(part); });

@@ -1,12 +1,14 @@
 #include "main/options.h"
 
+#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <string>
 #include <vector>
 
-#include "support/support.h"
-#include "support_disk/child.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/text.h"
 
 using support::contains;
 
@@ -65,7 +67,7 @@ TEST(Options, v_ends_the_parsing_before_a_wrong_option)
 
 TEST(Options, an_unknown_option_prints_the_usage_on_standard_error_and_exits_with_1)
 {
-    const auto result = support_disk::run_in_child([] {
+    const auto result = support::run_in_child([] {
         return 50 + parse_words({"./the_daemon", "-x"});
     });
     EXPECT_EQ(result.exit_code, 1);

@@ -1,20 +1,30 @@
 #include "disk/part_info.h"
 
+#include <gtest/gtest.h>
 #include <sys/vfs.h>
 
+#include <cstddef>
+#include <cstdint>
+#include <iterator>
 #include <string>
+#include <vector>
 
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
+using support::make_part;
 using support::write_file;
-using support_disk::make_part;
 
 namespace {
 
-class PartInfo : public support_disk::disk_world {
+class PartInfo : public support::disk_world {
 protected:
     // Fills the record of a partition that blkid describes so.
     part_info fill(const std::string& details)

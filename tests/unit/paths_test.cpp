@@ -5,7 +5,7 @@
 #include <cstring>
 #include <string>
 
-#include "support/support.h"
+#include "support/capture.h"
 
 using support::log_of;
 
@@ -24,7 +24,7 @@ std::string made(dev_path_maker maker, const char* name, size_t size = PATH_SIZE
 
 }  // namespace
 
-TEST(Paths, TheFixedOnesAreThoseThatOtherProgramsKnow)
+TEST(Paths, the_fixed_ones_are_those_that_other_programs_know)
 {
     EXPECT_STREQ(RUNTIME_DIR, "/tmp/tarn_nas/");
     EXPECT_STREQ(PID_FILE, "/tmp/tarn_nas//disk_manager_pid");
@@ -40,7 +40,7 @@ TEST(Paths, TheFixedOnesAreThoseThatOtherProgramsKnow)
     EXPECT_STREQ(LABEL_SCRIPT, "/usr/bin/disk_get_label.sh");
 }
 
-TEST(Paths, TheScratchFilesStandInTmp)
+TEST(Paths, the_scratch_files_stand_in_tmp)
 {
     EXPECT_STREQ(SCRATCH_PGREP, "/tmp/disk_pid_tmp");
     EXPECT_STREQ(SCRATCH_PIDOF, "/tmp/pid");
@@ -51,7 +51,7 @@ TEST(Paths, TheScratchFilesStandInTmp)
     EXPECT_STREQ(SCRATCH_LABEL, "/tmp/disk_label");
 }
 
-TEST(Paths, AreMadeFromDeviceNames)
+TEST(Paths, are_made_from_device_names)
 {
     struct {
         dev_path_maker maker;
@@ -71,14 +71,14 @@ TEST(Paths, AreMadeFromDeviceNames)
     }
 }
 
-TEST(Paths, TheSizeOfAPartitionStandsBelowItsDisk)
+TEST(Paths, the_size_of_a_partition_stands_below_its_disk)
 {
     char out[PATH_SIZE];
     path_sys_part_size(out, "sda", "sda1");
     EXPECT_STREQ(out, "/sys/block/sda/sda1/size");
 }
 
-TEST(Paths, AreCutToTheirBuffer)
+TEST(Paths, are_cut_to_their_buffer)
 {
     for (size_t length : {122U, 123U, 200U}) {
         std::string name(length, 'a');
@@ -87,7 +87,7 @@ TEST(Paths, AreCutToTheirBuffer)
     }
 }
 
-TEST(Paths, TheMountNameHoldsBothNumbers)
+TEST(Paths, the_mount_name_holds_both_numbers)
 {
     struct {
         int32_t disk;
@@ -104,7 +104,7 @@ TEST(Paths, TheMountNameHoldsBothNumbers)
     }
 }
 
-TEST(MountPathToName, DropsTheLengthOfTheMountBaseAndOneSlash)
+TEST(MountPathToName, drops_the_length_of_the_mount_base_and_one_slash)
 {
     struct {
         const char* path;
@@ -126,7 +126,7 @@ TEST(MountPathToName, DropsTheLengthOfTheMountBaseAndOneSlash)
     }
 }
 
-TEST(MountPathToName, RefusesAPathShorterThanTheMountBase)
+TEST(MountPathToName, refuses_a_path_shorter_than_the_mount_base)
 {
     for (const char* path : {"", "/", "/tmp/mount", "0123456789"}) {
         char out[32] = "kept";
@@ -135,7 +135,7 @@ TEST(MountPathToName, RefusesAPathShorterThanTheMountBase)
     }
 }
 
-TEST(MountPathToName, RefusesANullArgument)
+TEST(MountPathToName, refuses_a_null_argument)
 {
     char out[32];
     std::string log = log_of([&] {
@@ -145,7 +145,7 @@ TEST(MountPathToName, RefusesANullArgument)
     EXPECT_EQ(log, "ERROR[paths.cpp:N]err!\nERROR[paths.cpp:N]err!\n");
 }
 
-TEST(MountPathToName, IsBoundedByTheBuffer)
+TEST(MountPathToName, is_bounded_by_the_buffer)
 {
     char out[9] = "########";
     EXPECT_EQ(mount_path_to_name("/tmp/mountd/1234567", out, 8), 0);
@@ -154,7 +154,7 @@ TEST(MountPathToName, IsBoundedByTheBuffer)
     EXPECT_STREQ(out, "1234567");
 }
 
-TEST(NameIsPlain, TakesKernelNames)
+TEST(NameIsPlain, takes_kernel_names)
 {
     for (const char* name : {"sda", "sda15", "hdb", "mmcblk0p1", "mmcblk0boot0", "loop0", "dm-0",
                              "nvme0n1", "cciss!c0d0", "md127", "a.b_c", "SDA"}) {
@@ -162,7 +162,7 @@ TEST(NameIsPlain, TakesKernelNames)
     }
 }
 
-TEST(NameIsPlain, RefusesWhatTheShellWouldRead)
+TEST(NameIsPlain, refuses_what_the_shell_would_read)
 {
     for (const char* name :
          {"sda1;reboot", "sda 1", "sda1\n", "sda\t1", "$(reboot)", "`reboot`",  "sda1&",
@@ -173,7 +173,7 @@ TEST(NameIsPlain, RefusesWhatTheShellWouldRead)
     }
 }
 
-TEST(MountPathIsUsable, TakesNamesDirectlyBelowTheMountBase)
+TEST(MountPathIsUsable, takes_names_directly_below_the_mount_base)
 {
     for (const char* path : {"/tmp/mountd/disk1_part1", "/tmp/mountd/disk16_part8", "/tmp/mountd/a",
                              "/tmp/mountd/a.b"}) {
@@ -181,7 +181,7 @@ TEST(MountPathIsUsable, TakesNamesDirectlyBelowTheMountBase)
     }
 }
 
-TEST(MountPathIsUsable, RefusesEveryOtherPath)
+TEST(MountPathIsUsable, refuses_every_other_path)
 {
     for (const char* path :
          {"", "/", "/tmp", "/tmp/mount", "/tmp/mountd", "/tmp/mountd/", "/tmp/mountdx/disk1_part1",
@@ -192,7 +192,7 @@ TEST(MountPathIsUsable, RefusesEveryOtherPath)
     }
 }
 
-TEST(MountPathIsUsable, TakesNamesThatFitIntoARecord)
+TEST(MountPathIsUsable, takes_names_that_fit_into_a_record)
 {
     const std::string name(MOUNT_NAME_SIZE - 1, 'a');
     EXPECT_TRUE(mount_path_is_usable(("/tmp/mountd/" + name).c_str()));

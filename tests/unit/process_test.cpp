@@ -1,10 +1,18 @@
 #include "util/process.h"
 
 #include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <csignal>
+#include <cstdlib>
+#include <string>
+#include <vector>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/stubs.h"
+#include "support/text.h"
 
 using support::log_of;
 
@@ -20,7 +28,7 @@ protected:
 
 }  // namespace
 
-TEST_F(Process, TheFirstPidThatPidofReportsIsTaken)
+TEST_F(Process, the_first_pid_that_pidof_reports_is_taken)
 {
     stubs.add("pidof", "echo 4711 12 13");
     std::string log = log_of([] { EXPECT_EQ(proc_pid_of("tarn_nas_sys"), 4711); });
@@ -30,14 +38,14 @@ TEST_F(Process, TheFirstPidThatPidofReportsIsTaken)
         << log;
 }
 
-TEST_F(Process, NoPidIsZero)
+TEST_F(Process, no_pid_is_zero)
 {
     stubs.add("pidof", "exit 1");
     std::string log = log_of([] { EXPECT_EQ(proc_pid_of("nobody"), 0); });
     EXPECT_FALSE(support::contains(log, "get app")) << log;
 }
 
-TEST_F(Process, AMissingPidofIsZero)
+TEST_F(Process, a_missing_pidof_is_zero)
 {
     support::capture_stderr([] {
         setenv("PATH", "/nowhere", 1);
@@ -45,14 +53,14 @@ TEST_F(Process, AMissingPidofIsZero)
     });
 }
 
-TEST_F(Process, AnAnswerFileThatIsMissingIsZero)
+TEST_F(Process, an_answer_file_that_is_missing_is_zero)
 {
     support::write_file("/tmp/pid", "99\n");
     stubs.add("pidof", "rm -f /tmp/pid");
     log_of([] { EXPECT_EQ(proc_pid_of("nobody"), 0); });
 }
 
-TEST_F(Process, TheOldAnswerIsDeletedFirst)
+TEST_F(Process, the_old_answer_is_deleted_first)
 {
     support::write_file("/tmp/pid", "99\n");
     stubs.add("pidof");
@@ -64,7 +72,7 @@ TEST_F(Process, TheOldAnswerIsDeletedFirst)
         << log;
 }
 
-TEST_F(Process, ACommandOfMoreThan127CharactersIsCut)
+TEST_F(Process, a_command_of_more_than_127_characters_is_cut)
 {
     stubs.add("pidof", "echo 5");
     // "pidof ", " > " and "/tmp/pid" are 17 characters.
@@ -76,14 +84,14 @@ TEST_F(Process, ACommandOfMoreThan127CharactersIsCut)
     support::remove_all("/tmp/pi");
 }
 
-TEST_F(Process, ExistsWhenItHasAPid)
+TEST_F(Process, exists_when_it_has_a_pid)
 {
     stubs.add("pidof", "echo 5");
     std::string log = log_of([] { EXPECT_EQ(proc_exists("tarn_nas_sys"), 1); });
     EXPECT_FALSE(support::contains(log, "proc not exist")) << log;
 }
 
-TEST_F(Process, WithoutAPidItsAbsenceIsAWarning)
+TEST_F(Process, without_a_pid_its_absence_is_a_warning)
 {
     stubs.add("pidof", "exit 1");
     std::string log = log_of([] { EXPECT_EQ(proc_exists("tarn_nas_sys"), 0); });
@@ -92,7 +100,7 @@ TEST_F(Process, WithoutAPidItsAbsenceIsAWarning)
         << log;
 }
 
-TEST_F(Process, TheRealPidofFindsARunningProgram)
+TEST_F(Process, the_real_pidof_finds_a_running_program)
 {
     pid_t child = fork();
     if (child == 0) {

@@ -10,8 +10,9 @@
 #include <csignal>
 #include <string>
 
+#include "support/capture.h"
 #include "support/files.h"
-#include "support/support.h"
+#include "support/text.h"
 
 using support::contains;
 using support::exists;

@@ -1,20 +1,32 @@
 #include "disk/removal.h"
 
+#include <gtest/gtest.h>
+
+#include <filesystem>
 #include <string>
+#include <vector>
 
 #include "disk/disk_db.h"
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/clock.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 #include "util/fs_code.h"
+#include "util/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::is_all_zero;
-using support_disk::put_part;
-using support_disk::put_root;
+using support::is_all_zero;
+using support::put_part;
+using support::put_root;
 
 namespace {
 
-class Removal : public support_disk::disk_world {
+class Removal : public support::disk_world {
 protected:
     // A disk whose slots carry mounted partitions of these numbers.
     void put_mounted_disk(int place, const std::string& disk, const std::vector<int>& slots)
@@ -45,7 +57,7 @@ protected:
         return disk_db_get(uid, &record) == 0 ? record.mountd : -1;
     }
 
-    support_disk::skipped_sleeps no_sleep;
+    support::skipped_sleeps no_sleep;
     disk_sets sets{};
 };
 
@@ -62,7 +74,7 @@ TEST_F(Removal, a_part_is_unmounted_by_device_and_by_path_and_noted_as_unmounted
     EXPECT_EQ(stored_mountd("U-sda1"), 0);
     EXPECT_EQ(part->mount_status, 1) << "the record is left to the caller";
     EXPECT_TRUE(std::filesystem::exists("/tmp/mountd/disk1_part1"));
-    EXPECT_EQ(support_disk::the_clock.slept, 0);
+    EXPECT_EQ(support::the_clock.slept, 0);
     EXPECT_TRUE(contains(log, "]==> umount dev = sda1\n"));
 }
 
@@ -77,11 +89,11 @@ TEST_F(Removal, a_part_without_names_runs_no_umount)
 TEST_F(Removal, a_device_that_stays_mounted_is_tried_ten_more_times_a_second_apart)
 {
     put_mounted_disk(0, "sda", {0});
-    support::write_file(support_disk::UMOUNT_BUSY, std::string(50, 'x'));
+    support::write_file(support::UMOUNT_BUSY, std::string(50, 'x'));
     umount_part(&sets.entries[0].disk.parts[0].part);
     EXPECT_EQ(times_called("umount /dev/sda1"), 1);
     EXPECT_EQ(times_called("umount /tmp/mountd/disk1_part1"), 1 + UMOUNT_TRIES);
-    EXPECT_EQ(support_disk::the_clock.slept, 10);
+    EXPECT_EQ(support::the_clock.slept, 10);
     EXPECT_EQ(stored_mountd("U-sda1"), 0);
 }
 
@@ -89,12 +101,12 @@ TEST_F(Removal, further_attempts_end_when_the_device_is_gone_and_use_the_path_of
 {
     put_mounted_disk(0, "sda", {0});
     text_copy(sets.entries[0].disk.parts[0].part.mount_path, "/tmp/mountd/somewhere_else");
-    support::write_file(support_disk::UMOUNT_BUSY, "xxx");
+    support::write_file(support::UMOUNT_BUSY, "xxx");
     umount_part(&sets.entries[0].disk.parts[0].part);
     EXPECT_EQ(actions(), (std::vector<std::string>{
                              "umount /dev/sda1", "umount /tmp/mountd/somewhere_else",
                              "umount /tmp/mountd/disk1_part1", "umount /tmp/mountd/disk1_part1"}));
-    EXPECT_EQ(support_disk::the_clock.slept, 2);
+    EXPECT_EQ(support::the_clock.slept, 2);
 }
 
 TEST_F(Removal, a_listed_path_that_a_shell_would_read_reaches_no_command)
@@ -102,7 +114,7 @@ TEST_F(Removal, a_listed_path_that_a_shell_would_read_reaches_no_command)
     part_info part{};
     text_copy(part.dev_name, "sda1");
     add_mount("/dev/sda1", "/home/u/tmp/mountd/x;touch$IFS/run/harm");
-    support::write_file(support_disk::UMOUNT_BUSY, std::string(50, 'x'));
+    support::write_file(support::UMOUNT_BUSY, std::string(50, 'x'));
     const std::string log = capture_stdout([&] { umount_part(&part); });
     for (const std::string& call : actions()) {
         EXPECT_EQ(call, "umount /dev/sda1");
@@ -218,7 +230,7 @@ TEST_F(Removal, remove_dev_of_an_unknown_device_changes_nothing)
     });
     EXPECT_TRUE(contains(log, "]want remove dev(sdq) not exist!\n"));
     EXPECT_TRUE(contains(log, "]want remove dev(sdq1) not exist!\n"));
-    EXPECT_TRUE(support_disk::same_bytes(before, sets));
+    EXPECT_TRUE(support::same_bytes(before, sets));
     EXPECT_TRUE(stubs.calls().empty());
 }
 
@@ -253,7 +265,7 @@ TEST_F(Removal, remove_disk_with_an_unknown_name_changes_nothing_and_logs_one_li
         EXPECT_EQ(support::lines_of(log).size(), 1U) << log;
         EXPECT_TRUE(contains(log, std::string("remove disk name = ") + name + "\n"));
     }
-    EXPECT_TRUE(support_disk::same_bytes(before, sets));
+    EXPECT_TRUE(support::same_bytes(before, sets));
 }
 
 TEST_F(Removal, the_safe_removal_forgets_every_disk_that_the_kernel_lists)
@@ -274,8 +286,8 @@ TEST_F(Removal, the_safe_removal_forgets_every_disk_that_the_kernel_lists)
 TEST_F(Removal, the_safe_removal_fails_when_the_kernels_list_cannot_be_read)
 {
     put_mounted_disk(0, "sda", {0});
-    const std::string log = support_disk::expect_in_child([&] {
-        support_disk::allow_no_open_files();
+    const std::string log = support::expect_in_child([&] {
+        support::allow_no_open_files();
         EXPECT_EQ(safe_remove_all(&sets), 1);
         EXPECT_EQ(disk_sets_count(&sets), 1);
     });

@@ -4,10 +4,12 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <string>
 
+#include "support/capture.h"
 #include "support/files.h"
-#include "support/support.h"
+#include "support/text.h"
 
 using support::exists;
 using support::log_of;
@@ -40,7 +42,7 @@ using PathRemoveTree = Trees;
 
 }  // namespace
 
-TEST_F(Remove, RmRfTakesAWholeTreeInDoubleQuotes)
+TEST_F(Remove, rm_rf_takes_a_whole_tree_in_double_quotes)
 {
     std::string path = ROOT + "/with space";
     write_file(path + "/deep/file", "x");
@@ -52,7 +54,7 @@ TEST_F(Remove, RmRfTakesAWholeTreeInDoubleQuotes)
     EXPECT_TRUE(exists(ROOT + "/with"));
 }
 
-TEST_F(Remove, RmRfRefusesWhatAShellReadsInQuotes)
+TEST_F(Remove, rm_rf_refuses_what_a_shell_reads_in_quotes)
 {
     for (const char* name : {"$(touch harm)", "`touch harm`", "a\"; touch harm; \"", "a\\"}) {
         const std::string path = ROOT + "/" + name;
@@ -64,7 +66,7 @@ TEST_F(Remove, RmRfRefusesWhatAShellReadsInQuotes)
     }
 }
 
-TEST_F(Remove, RmRfTakesAPathOfAnyLength)
+TEST_F(Remove, rm_rf_takes_a_path_of_any_length)
 {
     std::string path = ROOT + "/" + std::string(250, 'a') + "/" + std::string(250, 'b');
     make_dir(path);
@@ -72,7 +74,7 @@ TEST_F(Remove, RmRfTakesAPathOfAnyLength)
     EXPECT_FALSE(exists(path));
 }
 
-TEST_F(Remove, RmRfWhoseCommandIsKilledGivesOne)
+TEST_F(Remove, rm_rf_whose_command_is_killed_gives_one)
 {
     // The shell itself is killed: the path ends the quotes.
     std::string path = ROOT + "/x\"; kill -KILL $$; \"";
@@ -84,7 +86,7 @@ TEST_F(Remove, RmRfWhoseCommandIsKilledGivesOne)
     });
 }
 
-TEST_F(Remove, AFileGoesWithoutACommand)
+TEST_F(Remove, a_file_goes_without_a_command)
 {
     write_file(file, "x");
     std::string log = log_of([&] { EXPECT_EQ(file_remove_retry(file.c_str()), 0); });
@@ -92,7 +94,7 @@ TEST_F(Remove, AFileGoesWithoutACommand)
     EXPECT_FALSE(exists(file));
 }
 
-TEST_F(Remove, AFileThatStaysIsRemovedByRmRf)
+TEST_F(Remove, a_file_that_stays_is_removed_by_rm_rf)
 {
     write_file(ROOT + "/dir/entry", "");
     std::string path = ROOT + "/dir";
@@ -101,7 +103,7 @@ TEST_F(Remove, AFileThatStaysIsRemovedByRmRf)
     EXPECT_FALSE(exists(path));
 }
 
-TEST_F(Remove, AnEmptyDirectoryGoes)
+TEST_F(Remove, an_empty_directory_goes)
 {
     std::string path = ROOT + "/dir";
     make_dir(path);
@@ -109,7 +111,7 @@ TEST_F(Remove, AnEmptyDirectoryGoes)
     EXPECT_FALSE(exists(path));
 }
 
-TEST_F(Remove, ADirectoryThatIsNotEmptyStays)
+TEST_F(Remove, a_directory_that_is_not_empty_stays)
 {
     write_file(ROOT + "/dir/entry", "");
     std::string path = ROOT + "/dir";
@@ -118,7 +120,7 @@ TEST_F(Remove, ADirectoryThatIsNotEmptyStays)
     EXPECT_TRUE(exists(ROOT + "/dir/entry"));
 }
 
-TEST_F(Remove, ALinkGoesAndItsTargetStays)
+TEST_F(Remove, a_link_goes_and_its_target_stays)
 {
     write_file(file, "x");
     std::string link = ROOT + "/link";
@@ -128,7 +130,7 @@ TEST_F(Remove, ALinkGoesAndItsTargetStays)
     EXPECT_TRUE(exists(file));
 }
 
-TEST_F(Remove, AMissingLinkGivesTheSystemsError)
+TEST_F(Remove, a_missing_link_gives_the_systems_error)
 {
     std::string log = log_of([&] { EXPECT_EQ(link_remove_retry(missing.c_str()), 1); });
     EXPECT_EQ(
@@ -136,7 +138,7 @@ TEST_F(Remove, AMissingLinkGivesTheSystemsError)
         "ERROR[remove_tree.cpp:N](No such file or directory)rm err, fn = /run/trees/missing\n");
 }
 
-TEST_F(PathGetType, TellsDirectoriesFilesLinksAndTheRest)
+TEST_F(PathGetType, tells_directories_files_links_and_the_rest)
 {
     write_file(file, "");
     ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
@@ -160,20 +162,20 @@ TEST_F(PathGetType, TellsDirectoriesFilesLinksAndTheRest)
     }
 }
 
-TEST_F(PathGetType, AMissingPathIsAnErrorWithTheSystemsText)
+TEST_F(PathGetType, a_missing_path_is_an_error_with_the_systems_text)
 {
     std::string log = log_of([&] { EXPECT_EQ(path_get_type(missing.c_str()), -1); });
     EXPECT_EQ(log, "ERROR[remove_tree.cpp:N](No such file or directory)file not exist, file = "
                    "/run/trees/missing\n");
 }
 
-TEST_F(PathGetType, ANullPathIsAnError)
+TEST_F(PathGetType, a_null_path_is_an_error)
 {
     std::string log = log_of([] { EXPECT_EQ(path_get_type(nullptr), -1); });
     EXPECT_EQ(log, "ERROR[remove_tree.cpp:N]err!\n");
 }
 
-TEST_F(PathRemoveTree, TakesAFileALinkAndATree)
+TEST_F(PathRemoveTree, takes_a_file_a_link_and_a_tree)
 {
     write_file(ROOT + "/tree/file", "x");
     write_file(ROOT + "/tree/deep/deeper/file", "x");
@@ -186,7 +188,7 @@ TEST_F(PathRemoveTree, TakesAFileALinkAndATree)
     EXPECT_TRUE(std::filesystem::is_empty(ROOT));
 }
 
-TEST_F(PathRemoveTree, LeavesWhatIsHiddenAndItsDirectoryAndStillGivesZero)
+TEST_F(PathRemoveTree, leaves_what_is_hidden_and_its_directory_and_still_gives_zero)
 {
     for (const char* hidden : {"/tree/.hidden", "/tree/..dir/file"}) {
         write_file(ROOT + hidden, "x");
@@ -200,7 +202,7 @@ TEST_F(PathRemoveTree, LeavesWhatIsHiddenAndItsDirectoryAndStillGivesZero)
     }
 }
 
-TEST_F(PathRemoveTree, ALinkToADirectoryIsUnlinkedAndItsTargetStays)
+TEST_F(PathRemoveTree, a_link_to_a_directory_is_unlinked_and_its_target_stays)
 {
     write_file(ROOT + "/target/file", "x");
     std::string link = ROOT + "/link";
@@ -210,7 +212,7 @@ TEST_F(PathRemoveTree, ALinkToADirectoryIsUnlinkedAndItsTargetStays)
     EXPECT_TRUE(exists(ROOT + "/target/file"));
 }
 
-TEST_F(PathRemoveTree, ALinkInsideATreeIsNotFollowed)
+TEST_F(PathRemoveTree, a_link_inside_a_tree_is_not_followed)
 {
     write_file(ROOT + "/target/file", "x");
     make_dir(ROOT + "/tree");
@@ -220,14 +222,14 @@ TEST_F(PathRemoveTree, ALinkInsideATreeIsNotFollowed)
     EXPECT_TRUE(exists(ROOT + "/target/file"));
 }
 
-TEST_F(PathRemoveTree, LeavesTheWorkingDirectoryInTheParent)
+TEST_F(PathRemoveTree, leaves_the_working_directory_in_the_parent)
 {
     write_file(ROOT + "/tree/deep/file", "x");
     EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
     EXPECT_EQ(std::filesystem::current_path(), ROOT);
 }
 
-TEST_F(PathRemoveTree, ARelativePathOfTwoNamesLeavesItsEmptyDirectory)
+TEST_F(PathRemoveTree, a_relative_path_of_two_names_leaves_its_empty_directory)
 {
     // The directory is removed by the path as it was given, from inside its parent.
     write_file(ROOT + "/tree/deep/file", "x");
@@ -237,7 +239,7 @@ TEST_F(PathRemoveTree, ARelativePathOfTwoNamesLeavesItsEmptyDirectory)
     EXPECT_TRUE(std::filesystem::is_empty(ROOT + "/tree/deep"));
 }
 
-TEST_F(PathRemoveTree, WhatIsNeitherFileLinkNorDirectoryIsRefused)
+TEST_F(PathRemoveTree, what_is_neither_file_link_nor_directory_is_refused)
 {
     ASSERT_EQ(mkfifo((ROOT + "/fifo").c_str(), 0600), 0);
     EXPECT_EQ(path_remove_tree((ROOT + "/fifo").c_str()), 1);

@@ -1,16 +1,25 @@
 #include "manager/rescan.h"
 
+#include <gtest/gtest.h>
+
+#include <cstdint>
+#include <cstdio>
 #include <string>
 
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/disk_world.h"
+#include "support/records.h"
+#include "support/text.h"
 
 using support::capture_stdout;
 using support::contains;
-using support_disk::expect_in_child;
+using support::expect_in_child;
 
 namespace {
 
-class Rescan : public support_disk::disk_world {
+class Rescan : public support::disk_world {
 protected:
     void plug(const std::string& name) { plug_disk(name, R"(PTTYPE="dos")", 5000); }
 
@@ -57,7 +66,7 @@ TEST_F(Rescan, the_first_rescan_offers_known_disks_again_and_the_inventory_ignor
 {
     const std::string log = capture_stdout([&] {
         plug("sda");
-        support_disk::put_root(&sets.entries[0], "sda", 5000);
+        support::put_root(&sets.entries[0], "sda", 5000);
         EXPECT_EQ(rescan(), 1);
         EXPECT_EQ(disk_sets_count(&sets), 1);
     });
@@ -131,7 +140,7 @@ TEST_F(Rescan, a_list_that_cannot_be_read_changes_nothing)
     const std::string log = expect_in_child([&] {
         plug("sda");
         rescan();
-        support_disk::allow_no_open_files();
+        support::allow_no_open_files();
         int32_t changed = 0;
         EXPECT_FALSE(rescan_block_devices(&sets, &changed));
         EXPECT_EQ(changed, 0);
@@ -148,6 +157,6 @@ TEST_F(Rescan, a_disk_that_vanished_unannounced_is_removed_with_all_its_partitio
     ASSERT_NE(disk_sets_find_part(&sets, "sda1"), nullptr);
     unplug("sda");
     EXPECT_EQ(rescan(), 1);
-    EXPECT_TRUE(support_disk::is_all_zero(sets));
+    EXPECT_TRUE(support::is_all_zero(sets));
     EXPECT_EQ(times_called("umount /dev/sda1"), 1);
 }

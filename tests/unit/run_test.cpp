@@ -1,27 +1,35 @@
 #include "main/run.h"
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <csignal>
+#include <filesystem>
 #include <string>
+#include <vector>
 
 #include "log/log.h"
 #include "main/signals.h"
 #include "manager/manager.h"
-#include "support_disk/disk_world.h"
+#include "support/capture.h"
+#include "support/clock.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/text.h"
+#include "util/paths.h"
 
 using support::capture_stdout;
 using support::contains;
+using support::fake_clock;
 using support::read_file;
+using support::the_clock;
 using support::write_file;
-using support_disk::fake_clock;
-using support_disk::the_clock;
 
 namespace {
 
-class Environment : public support_disk::disk_world {
+class Environment : public support::disk_world {
 protected:
     // A running restart leaves this file, with what it saw of the pid file.
     void add_restart_script()
@@ -109,7 +117,7 @@ private:
     int open_before;
 };
 
-class SingleInstance : public support_disk::disk_world {
+class SingleInstance : public support::disk_world {
 protected:
     // What pgrep prints.
     void list_pids(const std::string& text)

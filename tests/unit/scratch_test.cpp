@@ -3,9 +3,11 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <string>
 
+#include "support/capture.h"
 #include "support/files.h"
-#include "support/support.h"
+#include "support/text.h"
 
 using support::contains;
 using support::log_of;
@@ -62,7 +64,7 @@ protected:
 
 }  // namespace
 
-TEST_F(Scratch, EachReaderGivesWhatTheProgramSays)
+TEST_F(Scratch, each_reader_gives_what_the_program_says)
 {
     log_of([] {
         EXPECT_EQ(text_of(DELETED, "echo 'one two' > %s"), "one two\n");
@@ -72,7 +74,7 @@ TEST_F(Scratch, EachReaderGivesWhatTheProgramSays)
     });
 }
 
-TEST_F(Scratch, TheFirstCharactersAreCutToTheBuffer)
+TEST_F(Scratch, the_first_characters_are_cut_to_the_buffer)
 {
     log_of([] {
         EXPECT_EQ(first_of(DELETED, "printf 1234567 > %s", 8), "1234567");
@@ -80,7 +82,7 @@ TEST_F(Scratch, TheFirstCharactersAreCutToTheBuffer)
     });
 }
 
-TEST_F(Scratch, TheCommandIsLoggedAtThePlaceThatAsks)
+TEST_F(Scratch, the_command_is_logged_at_the_place_that_asks)
 {
     const char* const expected = "scratch_test.cpp(N)exec cmd = true > /tmp/scratch_place\n";
     EXPECT_TRUE(contains(log_of([] { text_of(DELETED, "true > %s"); }), expected));
@@ -88,7 +90,7 @@ TEST_F(Scratch, TheCommandIsLoggedAtThePlaceThatAsks)
     EXPECT_TRUE(contains(log_of([] { lines_of(DELETED, "true > %s"); }), expected));
 }
 
-TEST_F(Scratch, TheFileIsKeptOrDeletedAsTheQuerySays)
+TEST_F(Scratch, the_file_is_kept_or_deleted_as_the_query_says)
 {
     log_of([] {
         for (auto* reader : {text_of, lines_of}) {
@@ -106,7 +108,7 @@ TEST_F(Scratch, TheFileIsKeptOrDeletedAsTheQuerySays)
     });
 }
 
-TEST_F(Scratch, WhatCannotBeReadIsDeletedOnlyInTheFirstOfTheseCases)
+TEST_F(Scratch, what_cannot_be_read_is_deleted_only_in_the_first_of_these_cases)
 {
     const char* const vanishes = "rm -f %s";
     for (auto* reader : {text_of, lines_of}) {
@@ -120,7 +122,7 @@ TEST_F(Scratch, WhatCannotBeReadIsDeletedOnlyInTheFirstOfTheseCases)
                          NOTHING_TO_DELETE));
 }
 
-TEST_F(Scratch, AnEarlierAnswerIsDeletedFirstWhenTheQuerySaysSo)
+TEST_F(Scratch, an_earlier_answer_is_deleted_first_when_the_query_says_so)
 {
     EXPECT_TRUE(contains(log_of([] { text_of(STARTS_CLEAR, "true > %s"); }), NOTHING_TO_DELETE));
     EXPECT_FALSE(contains(log_of([] { text_of(STARTS_CLEAR, "true > %s"); }), NOTHING_TO_DELETE));
@@ -128,13 +130,13 @@ TEST_F(Scratch, AnEarlierAnswerIsDeletedFirstWhenTheQuerySaysSo)
     EXPECT_FALSE(contains(log_of([] { text_of(KEPT, "true > %s"); }), NOTHING_TO_DELETE));
 }
 
-TEST_F(Scratch, AnEarlierAnswerIsNeverTakenForANewOne)
+TEST_F(Scratch, an_earlier_answer_is_never_taken_for_a_new_one)
 {
     support::write_file(PLACE, "old");
     log_of([] { EXPECT_EQ(text_of(KEPT, "true %s"), ""); });
 }
 
-TEST_F(Scratch, WhatAKilledProgramSaidCountsUnlessTheQueryWantsItsEnd)
+TEST_F(Scratch, what_a_killed_program_said_counts_unless_the_query_wants_its_end)
 {
     support::capture_stderr([] {
         log_of([] {
@@ -145,7 +147,7 @@ TEST_F(Scratch, WhatAKilledProgramSaidCountsUnlessTheQueryWantsItsEnd)
     });
 }
 
-TEST_F(Scratch, WhereNoFileCanBeMadeNothingRunsAndNothingIsDeleted)
+TEST_F(Scratch, where_no_file_can_be_made_nothing_runs_and_nothing_is_deleted)
 {
     std::string log = log_of([] {
         const scratch_text answer(LOST, "touch /run/ran %s", {NOWHERE});
@@ -158,7 +160,7 @@ TEST_F(Scratch, WhereNoFileCanBeMadeNothingRunsAndNothingIsDeleted)
     EXPECT_FALSE(contains(log, "del err!")) << log;
 }
 
-TEST_F(Scratch, ARefusedWordRunsNothingAndIsLogged)
+TEST_F(Scratch, a_refused_word_runs_nothing_and_is_logged)
 {
     std::string log = log_of([] {
         const scratch_text answer(STARTS_CLEAR, "pidof %s > %s", {"a;touch /run/ran", PLACE});

@@ -1,21 +1,29 @@
 #include "manager/services.h"
 
-#include <string>
+#include <gtest/gtest.h>
 
-#include "support_disk/disk_world.h"
+#include <string>
+#include <vector>
+
+#include "support/capture.h"
+#include "support/clock.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/text.h"
+#include "util/paths.h"
 
 using support::capture_stdout;
 using support::contains;
+using support::fake_clock;
 using support::read_file;
+using support::the_clock;
 using support::write_file;
-using support_disk::fake_clock;
-using support_disk::the_clock;
 
 namespace {
 
 constexpr char RELOAD[] = "/etc/init.d/firewall reload";
 
-class FirewallRule : public support_disk::disk_world {
+class FirewallRule : public support::disk_world {
 protected:
     FirewallRule()
     {
@@ -53,7 +61,7 @@ protected:
     fake_clock clock{1000000};
 };
 
-class Services : public support_disk::disk_world {};
+class Services : public support::disk_world {};
 
 }  // namespace
 

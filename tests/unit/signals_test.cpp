@@ -1,16 +1,20 @@
 #include "main/signals.h"
 
+#include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
+#include <cstdio>
 #include <string>
 
 #include "log/log.h"
 #include "manager/manager.h"
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/files.h"
+#include "support/text.h"
 
 using support::capture_stdout;
 using support::contains;

@@ -1,5 +1,6 @@
 #include "disk/system_disk.h"
 
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/sysmacros.h>
 #include <unistd.h>
@@ -7,11 +8,16 @@
 #include <string>
 
 #include "disk/discovery.h"
-#include "support_disk/disk_world.h"
+#include "disk/disk_sets.h"
+#include "support/capture.h"
+#include "support/disk_world.h"
+#include "support/files.h"
+#include "support/records.h"
+#include "support/text.h"
 
 using support::capture_stdout;
 using support::count_of;
-using support_disk::is_all_zero;
+using support::is_all_zero;
 
 namespace {
 
@@ -24,7 +30,7 @@ dev_t number_below(const char* dir)
     return info.st_dev;
 }
 
-class SystemDisk : public support_disk::disk_world {
+class SystemDisk : public support::disk_world {
 protected:
     SystemDisk()
     {

@@ -27,7 +27,7 @@ struct dirty_buffer {
 
 }  // namespace
 
-TEST(TextCopy, CutsAtOneLessThanTheSize)
+TEST(TextCopy, cuts_at_one_less_than_the_size)
 {
     struct {
         const char* text;
@@ -46,7 +46,7 @@ TEST(TextCopy, CutsAtOneLessThanTheSize)
     }
 }
 
-TEST(TextCopy, ZeroFillsTheRest)
+TEST(TextCopy, zero_fills_the_rest)
 {
     dirty_buffer out;
     text_copy({out.bytes, 16}, "abc");
@@ -54,7 +54,7 @@ TEST(TextCopy, ZeroFillsTheRest)
     EXPECT_TRUE(out.untouched_from(16));
 }
 
-TEST(TextCopy, ABufferOfOneByteHoldsTheEmptyText)
+TEST(TextCopy, a_buffer_of_one_byte_holds_the_empty_text)
 {
     dirty_buffer out;
     text_copy({out.bytes, 1}, "abc");
@@ -62,14 +62,14 @@ TEST(TextCopy, ABufferOfOneByteHoldsTheEmptyText)
     EXPECT_TRUE(out.untouched_from(1));
 }
 
-TEST(TextCopy, ABufferOfNoBytesIsLeftAlone)
+TEST(TextCopy, a_buffer_of_no_bytes_is_left_alone)
 {
     dirty_buffer out;
     text_copy({out.bytes, 0}, "abc");
     EXPECT_TRUE(out.untouched_from(0));
 }
 
-TEST(TextCopy, TakesTheSizeOfAnArrayByItself)
+TEST(TextCopy, takes_the_size_of_an_array_by_itself)
 {
     char out[4];
     text_copy(out, "abcdef");
@@ -78,7 +78,7 @@ TEST(TextCopy, TakesTheSizeOfAnArrayByItself)
     EXPECT_EQ(std::string(out, 4), std::string(4, '\0'));
 }
 
-TEST(TextCopyN, TakesAtMostThatManyCharacters)
+TEST(TextCopyN, takes_at_most_that_many_characters)
 {
     dirty_buffer out;
     text_copy_n({out.bytes, 8}, "abcdef", 3);
@@ -93,7 +93,7 @@ TEST(TextCopyN, TakesAtMostThatManyCharacters)
     EXPECT_TRUE(out.untouched_from(8));
 }
 
-TEST(TextFormat, CutsAndZeroFills)
+TEST(TextFormat, cuts_and_zero_fills)
 {
     dirty_buffer out;
     text_format({out.bytes, 8}, "%s-%d", "ab", 7);
@@ -104,7 +104,7 @@ TEST(TextFormat, CutsAndZeroFills)
     EXPECT_TRUE(out.untouched_from(8));
 }
 
-TEST(TextHasPrefix, ComparesFromTheStart)
+TEST(TextHasPrefix, compares_from_the_start)
 {
     EXPECT_TRUE(text_has_prefix("remove_dev", "remove"));
     EXPECT_TRUE(text_has_prefix("remove", "remove"));
@@ -113,7 +113,7 @@ TEST(TextHasPrefix, ComparesFromTheStart)
     EXPECT_FALSE(text_has_prefix("a remove", "remove"));
 }
 
-TEST(StrEqual, WantsTheSameLengthAndTheSameBytes)
+TEST(StrEqual, wants_the_same_length_and_the_same_bytes)
 {
     EXPECT_EQ(str_equal("sda", "sda"), 0);
     EXPECT_EQ(str_equal("", ""), 0);
@@ -124,7 +124,7 @@ TEST(StrEqual, WantsTheSameLengthAndTheSameBytes)
     EXPECT_EQ(str_equal("", "a"), 1);
 }
 
-TEST(StrEqual, WithANullIsNeverEqual)
+TEST(StrEqual, with_a_null_is_never_equal)
 {
     EXPECT_EQ(str_equal_nullsafe(nullptr, "a"), 1);
     EXPECT_EQ(str_equal_nullsafe("a", nullptr), 1);
@@ -133,7 +133,7 @@ TEST(StrEqual, WithANullIsNeverEqual)
     EXPECT_EQ(str_equal_nullsafe("a", "ab"), 1);
 }
 
-TEST(StrCountChar, CountsDashes)
+TEST(StrCountChar, counts_dashes)
 {
     struct {
         const char* text;
@@ -148,7 +148,7 @@ TEST(StrCountChar, CountsDashes)
     }
 }
 
-TEST(StrCountChar, ANullTextHasEnough)
+TEST(StrCountChar, a_null_text_has_enough)
 {
     EXPECT_EQ(str_count_char_at_least(nullptr, 3), 1);
 }

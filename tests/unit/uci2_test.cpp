@@ -3,8 +3,12 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <string>
 
-#include "support/support.h"
+#include "support/capture.h"
+#include "support/child.h"
+#include "support/files.h"
+#include "support/text.h"
 
 using support::contains;
 using support::count_of;
@@ -79,35 +83,35 @@ protected:
 
 }  // namespace
 
-TEST_F(Uci, FreeingNoContextGivesOne)
+TEST_F(Uci, freeing_no_context_gives_one)
 {
     EXPECT_EQ(uci2_free(nullptr), 1);
     EXPECT_EQ(uci2_free(uci2_new()), 0);
 }
 
-TEST_F(Uci, AnOptionReadsAsItsString)
+TEST_F(Uci, an_option_reads_as_its_string)
 {
     EXPECT_EQ(got("firewall.webdav_wan.target"), "ACCEPT");
     EXPECT_EQ(got("firewall.webdav_wan.port"), "8080");
 }
 
-TEST_F(Uci, AListReadsAsItsLastElement)
+TEST_F(Uci, a_list_reads_as_its_last_element)
 {
     EXPECT_EQ(got("firewall.webdav_wan.proto"), "udp");
 }
 
-TEST_F(Uci, ASectionReadsAsItsType)
+TEST_F(Uci, a_section_reads_as_its_type)
 {
     EXPECT_EQ(got("firewall.webdav_wan"), "rule");
     EXPECT_EQ(got("firewall.@zone[1]"), "zone");
 }
 
-TEST_F(Uci, APackageReadsAsTheEmptyText)
+TEST_F(Uci, a_package_reads_as_the_empty_text)
 {
     EXPECT_EQ(got("firewall"), "");
 }
 
-TEST_F(Uci, SectionsCanBeNamedByTypeAndIndex)
+TEST_F(Uci, sections_can_be_named_by_type_and_index)
 {
     EXPECT_EQ(got("firewall.@zone[0].name"), "lan");
     EXPECT_EQ(got("firewall.@zone[1].name"), "wan");
@@ -116,7 +120,7 @@ TEST_F(Uci, SectionsCanBeNamedByTypeAndIndex)
     EXPECT_EQ(got("firewall.@rule[0].target"), "ACCEPT");
 }
 
-TEST_F(Uci, AnIncompleteLookUpFailsWithNotFound)
+TEST_F(Uci, an_incomplete_look_up_fails_with_not_found)
 {
     for (const char* path :
          {"firewall.webdav_wan.missing", "firewall.missing.target", "firewall.missing",
@@ -127,7 +131,7 @@ TEST_F(Uci, AnIncompleteLookUpFailsWithNotFound)
     }
 }
 
-TEST_F(Uci, AMissingPackageOrABadPathFails)
+TEST_F(Uci, a_missing_package_or_a_bad_path_fails)
 {
     for (const char* path : {"missing.a.b", "", ".", "a b.c", "firewall.@zone[.name"}) {
         EXPECT_EQ(got(path, -1), "") << path;
@@ -138,7 +142,7 @@ TEST_F(Uci, AMissingPackageOrABadPathFails)
     EXPECT_EQ(uci2_get(nullptr, "firewall.webdav_wan.target", out, sizeof(out)), -1);
 }
 
-TEST_F(Uci, TheValueIsCutToItsBuffer)
+TEST_F(Uci, the_value_is_cut_to_its_buffer)
 {
     char out[7] = "######";
     EXPECT_EQ(uci2_get(ctx, "firewall.webdav_wan.target", out, 7), 0);
@@ -147,14 +151,14 @@ TEST_F(Uci, TheValueIsCutToItsBuffer)
     EXPECT_STREQ(out, "ACCEP");
 }
 
-TEST_F(Uci, ThePathOfTheCallerIsNotWrittenTo)
+TEST_F(Uci, the_path_of_the_caller_is_not_written_to)
 {
     char path[] = "firewall.@zone[1].name";
     EXPECT_EQ(got(path), "wan");
     EXPECT_STREQ(path, "firewall.@zone[1].name");
 }
 
-TEST_F(Uci, ReadingByIndexAndByName)
+TEST_F(Uci, reading_by_index_and_by_name)
 {
     char out[64];
     EXPECT_EQ(uci2_get_by_index(ctx, "firewall.@zone", 1, "name", out, sizeof(out)), 0);
@@ -171,7 +175,7 @@ TEST_F(Uci, ReadingByIndexAndByName)
     EXPECT_STREQ(out, "");
 }
 
-TEST_F(Uci, AChangeIsSavedAndStandsInTheFileAfterTheCommit)
+TEST_F(Uci, a_change_is_saved_and_stands_in_the_file_after_the_commit)
 {
     EXPECT_EQ(uci2_set(ctx, "firewall.webdav_wan.target", "REJECT"), 0);
     EXPECT_EQ(got("firewall.webdav_wan.target"), "REJECT");
@@ -185,14 +189,14 @@ TEST_F(Uci, AChangeIsSavedAndStandsInTheFileAfterTheCommit)
     EXPECT_EQ(read_afresh("firewall.webdav_wan.target"), "REJECT");
 }
 
-TEST_F(Uci, ANewOptionCanBeSet)
+TEST_F(Uci, a_new_option_can_be_set)
 {
     EXPECT_EQ(uci2_set(ctx, "firewall.webdav_wan.enabled", "1"), 0);
     EXPECT_EQ(uci2_commit(ctx, "firewall"), 0);
     EXPECT_TRUE(contains(on_disk(), "option enabled '1'"));
 }
 
-TEST_F(Uci, AValueOfAnyLengthCanBeSet)
+TEST_F(Uci, a_value_of_any_length_can_be_set)
 {
     std::string value(1000, 'v');
     EXPECT_EQ(uci2_set(ctx, "firewall.webdav_wan.target", value.c_str()), 0);
@@ -200,7 +204,7 @@ TEST_F(Uci, AValueOfAnyLengthCanBeSet)
     EXPECT_TRUE(contains(on_disk(), value));
 }
 
-TEST_F(Uci, SettingByIndexAndByName)
+TEST_F(Uci, setting_by_index_and_by_name)
 {
     EXPECT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 1, "name", "wan2"), 0);
     EXPECT_EQ(uci2_set_by_name(ctx, "firewall", "webdav_wan", "port", "9090"), 0);
@@ -211,7 +215,7 @@ TEST_F(Uci, SettingByIndexAndByName)
     EXPECT_TRUE(contains(on_disk(), "config rule 'fresh'"));
 }
 
-TEST_F(Uci, WithoutAValueNothingIsSetOrRenamed)
+TEST_F(Uci, without_a_value_nothing_is_set_or_renamed)
 {
     EXPECT_EQ(uci2_set(ctx, "firewall.webdav_wan.target", nullptr), -1);
     EXPECT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 0, "name", nullptr), -1);
@@ -222,7 +226,7 @@ TEST_F(Uci, WithoutAValueNothingIsSetOrRenamed)
     EXPECT_EQ(got("firewall.webdav_wan.target"), "ACCEPT");
 }
 
-TEST_F(Uci, RenamesSectionsAndOptions)
+TEST_F(Uci, renames_sections_and_options)
 {
     EXPECT_EQ(uci2_rename(ctx, "firewall.webdav_wan.port", "dest_port"), 0);
     EXPECT_EQ(uci2_rename(ctx, "firewall.webdav_wan", "webdav"), 0);
@@ -233,7 +237,7 @@ TEST_F(Uci, RenamesSectionsAndOptions)
     EXPECT_EQ(uci2_rename(ctx, "firewall.missing", "x"), -1);
 }
 
-TEST_F(Uci, DeletesSectionsAndOptions)
+TEST_F(Uci, deletes_sections_and_options)
 {
     EXPECT_EQ(uci2_delete(ctx, "firewall.webdav_wan.port"), 0);
     EXPECT_EQ(uci2_delete(ctx, "firewall.@zone[0]"), 0);
@@ -243,7 +247,7 @@ TEST_F(Uci, DeletesSectionsAndOptions)
     EXPECT_EQ(uci2_delete(ctx, "firewall.webdav_wan.port"), -1);
 }
 
-TEST_F(Uci, AListElementIsAddedWithoutBeingSaved)
+TEST_F(Uci, a_list_element_is_added_without_being_saved)
 {
     EXPECT_EQ(uci2_add_list(ctx, "firewall.webdav_wan.proto", "sctp"), 0);
     EXPECT_EQ(got("firewall.webdav_wan.proto"), "sctp");
@@ -253,7 +257,7 @@ TEST_F(Uci, AListElementIsAddedWithoutBeingSaved)
     EXPECT_EQ(uci2_add_list(ctx, "firewall.webdav_wan.proto", nullptr), -1);
 }
 
-TEST_F(Uci, AListElementIsTakenOutWithoutBeingSaved)
+TEST_F(Uci, a_list_element_is_taken_out_without_being_saved)
 {
     EXPECT_EQ(uci2_del_list(ctx, "firewall.webdav_wan.proto", "udp"), 0);
     EXPECT_EQ(got("firewall.webdav_wan.proto"), "tcp");
@@ -263,13 +267,13 @@ TEST_F(Uci, AListElementIsTakenOutWithoutBeingSaved)
     EXPECT_EQ(uci2_del_list(ctx, "firewall.webdav_wan.proto", nullptr), -1);
 }
 
-TEST_F(Uci, CommittingAMissingPackageGivesOne)
+TEST_F(Uci, committing_a_missing_package_gives_one)
 {
     EXPECT_EQ(uci2_commit(ctx, "missing"), 1);
     EXPECT_EQ(uci2_commit(ctx, nullptr), 1);
 }
 
-TEST_F(Uci, ANewUnnamedSectionIsCommittedAtOnce)
+TEST_F(Uci, a_new_unnamed_section_is_committed_at_once)
 {
     EXPECT_EQ(uci2_add_section("firewall", "redirect"), 0);
     EXPECT_EQ(count_of(on_disk(), "config redirect\n"), 1);
@@ -278,7 +282,7 @@ TEST_F(Uci, ANewUnnamedSectionIsCommittedAtOnce)
     EXPECT_EQ(uci2_add_section("missing", "redirect"), -1);
 }
 
-TEST_F(Uci, CountsTheSectionsOfAType)
+TEST_F(Uci, counts_the_sections_of_a_type)
 {
     EXPECT_EQ(uci2_count_type(ctx, "firewall.zone"), 2);
     EXPECT_EQ(uci2_count_type(ctx, "firewall.@zone"), 2);
@@ -290,7 +294,7 @@ TEST_F(Uci, CountsTheSectionsOfAType)
     EXPECT_EQ(uci2_count_type(ctx, nullptr), 0);
 }
 
-TEST_F(Uci, ATypeArgumentOf100BytesIsRefused)
+TEST_F(Uci, a_type_argument_of_100_bytes_is_refused)
 {
     // 99 bytes are taken: the type is as long as needed.
     std::string type(99 - strlen("firewall.@"), 't');
@@ -299,7 +303,7 @@ TEST_F(Uci, ATypeArgumentOf100BytesIsRefused)
     EXPECT_EQ(uci2_count_type(ctx, ("firewall.@" + type + "t").c_str()), 0);
 }
 
-TEST_F(Uci, ASearchArgumentOf100BytesIsRefused)
+TEST_F(Uci, a_search_argument_of_100_bytes_is_refused)
 {
     std::string option(99 - strlen("firewall.@zone."), 'o');
     support::write_file(file, "config zone 'z'\n\toption " + option + " '1'\n\toption " + option +
@@ -310,7 +314,7 @@ TEST_F(Uci, ASearchArgumentOf100BytesIsRefused)
     EXPECT_EQ(uci2_find_section(ctx, ("firewall.@zone." + option + "o").c_str(), "1"), nullptr);
 }
 
-TEST_F(Uci, GivesTheSectionOfATypeAndIndex)
+TEST_F(Uci, gives_the_section_of_a_type_and_index)
 {
     uci_section* section = uci2_get_section(ctx, "firewall.@zone", 1);
     ASSERT_NE(section, nullptr);
@@ -321,7 +325,7 @@ TEST_F(Uci, GivesTheSectionOfATypeAndIndex)
     EXPECT_EQ(uci2_get_section(ctx, "missing.@zone", 0), nullptr);
 }
 
-TEST_F(Uci, FindsTheFirstSectionWhoseOptionHasTheValue)
+TEST_F(Uci, finds_the_first_section_whose_option_has_the_value)
 {
     const char* name = uci2_find_section(ctx, "firewall.@rule.target", "ACCEPT");
     ASSERT_NE(name, nullptr);
@@ -339,7 +343,7 @@ TEST_F(Uci, FindsTheFirstSectionWhoseOptionHasTheValue)
     EXPECT_EQ(uci2_find_section(ctx, "firewall.@rule.target", nullptr), nullptr);
 }
 
-TEST_F(Uci, FindsAnElementOfAList)
+TEST_F(Uci, finds_an_element_of_a_list)
 {
     const char* element = uci2_list_contains(ctx, "firewall.webdav_wan.proto", "tcp");
     ASSERT_NE(element, nullptr);
@@ -351,7 +355,7 @@ TEST_F(Uci, FindsAnElementOfAList)
     EXPECT_EQ(uci2_list_contains(ctx, "firewall.webdav_wan.missing", "tcp"), nullptr);
 }
 
-TEST_F(Uci, GivesAListsElementByItsPlace)
+TEST_F(Uci, gives_a_lists_element_by_its_place)
 {
     char out[64] = "kept";
     EXPECT_EQ(uci2_list_item(ctx, "firewall.webdav_wan.proto", 2, out, sizeof(out)), 0);
@@ -366,7 +370,7 @@ TEST_F(Uci, GivesAListsElementByItsPlace)
     EXPECT_STREQ(out, "wan6");
 }
 
-TEST_F(Uci, CountsTheElementsOfAList)
+TEST_F(Uci, counts_the_elements_of_a_list)
 {
     EXPECT_EQ(uci2_list_count(ctx, "firewall.webdav_wan.proto"), 2);
     EXPECT_EQ(uci2_list_count(ctx, "firewall.webdav_wan.port"), 0);
@@ -375,7 +379,7 @@ TEST_F(Uci, CountsTheElementsOfAList)
 }
 
 // What the library itself would not survive runs in a process of its own.
-TEST_F(Uci, ASectionWithoutPackageOrTypeIsRefused)
+TEST_F(Uci, a_section_without_package_or_type_is_refused)
 {
     const std::string log = support::log_of([&] {
         EXPECT_EQ(support::in_child([] {
@@ -394,7 +398,7 @@ TEST_F(Uci, ASectionWithoutPackageOrTypeIsRefused)
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
-TEST_F(Uci, APathOf127CharactersIsTakenAndALongerOneNeverCut)
+TEST_F(Uci, a_path_of_127_characters_is_taken_and_a_longer_one_never_cut)
 {
     // The longer path, cut, would be the shorter one.
     const std::string option(127 - strlen("firewall.webdav_wan."), 'o');
@@ -424,7 +428,7 @@ TEST_F(Uci, APathOf127CharactersIsTakenAndALongerOneNeverCut)
     EXPECT_STREQ(out, "short");
 }
 
-TEST_F(Uci, APathThatIsTooLongNamesNoSection)
+TEST_F(Uci, a_path_that_is_too_long_names_no_section)
 {
     const std::string type = "firewall.@" + std::string(120, 't');
     EXPECT_TRUE(contains(
@@ -432,7 +436,7 @@ TEST_F(Uci, APathThatIsTooLongNamesNoSection)
         "uci path too long"));
 }
 
-TEST_F(Uci, WithoutATypeOrNameThereIsNoPath)
+TEST_F(Uci, without_a_type_or_name_there_is_no_path)
 {
     char out[8] = "rubbish";
     const std::string log = support::log_of([&] {
@@ -448,7 +452,7 @@ TEST_F(Uci, WithoutATypeOrNameThereIsNoPath)
     EXPECT_EQ(uci2_list_item(ctx, "firewall.webdav_wan.proto", 0, nullptr, 8), 0);
 }
 
-TEST_F(Uci, AListNeedsAnOption)
+TEST_F(Uci, a_list_needs_an_option)
 {
     for (const char* path : {"firewall.webdav_wan", "firewall.@zone[0]", "firewall"}) {
         const std::string log = support::log_of([&] {
@@ -469,7 +473,7 @@ TEST_F(Uci, AListNeedsAnOption)
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
-TEST_F(Uci, WhateverCharacterATypeHoldsTheFileCanStillBeRead)
+TEST_F(Uci, whatever_character_a_type_holds_the_file_can_still_be_read)
 {
     for (int c = 1; c < 256; ++c) {
         const std::string type = std::string("ty") + static_cast<char>(c) + "pe";
@@ -486,7 +490,7 @@ TEST_F(Uci, WhateverCharacterATypeHoldsTheFileCanStillBeRead)
     EXPECT_FALSE(contains(on_disk(), "config ty'pe\n"));
 }
 
-TEST_F(Uci, WhateverCharacterATypeThatIsSetHoldsTheFileCanStillBeRead)
+TEST_F(Uci, whatever_character_a_type_that_is_set_holds_the_file_can_still_be_read)
 {
     for (int c = 1; c < 256; ++c) {
         const std::string type = std::string("ty") + static_cast<char>(c) + "pe";
@@ -501,7 +505,7 @@ TEST_F(Uci, WhateverCharacterATypeThatIsSetHoldsTheFileCanStillBeRead)
     }
 }
 
-TEST_F(Uci, WhateverCharacterANameHoldsTheFileCanStillBeRead)
+TEST_F(Uci, whatever_character_a_name_holds_the_file_can_still_be_read)
 {
     for (int c = 1; c < 256; ++c) {
         const std::string name = std::string("na") + static_cast<char>(c) + "me";
@@ -525,7 +529,7 @@ TEST_F(Uci, WhateverCharacterANameHoldsTheFileCanStillBeRead)
     }
 }
 
-TEST_F(Uci, WhateverCharacterAValueHoldsItIsReadBackOrRefused)
+TEST_F(Uci, whatever_character_a_value_holds_it_is_read_back_or_refused)
 {
     for (int c = 1; c < 256; ++c) {
         const std::string value = std::string("va") + static_cast<char>(c) + "lue";
@@ -537,7 +541,7 @@ TEST_F(Uci, WhateverCharacterAValueHoldsItIsReadBackOrRefused)
     }
 }
 
-TEST_F(Uci, ASectionThatIsNotThereIsNotMadeUnderItsIndex)
+TEST_F(Uci, a_section_that_is_not_there_is_not_made_under_its_index)
 {
     EXPECT_EQ(uci2_set(ctx, "firewall.@zone[7]", "zone"), -1);
     EXPECT_EQ(uci2_set_by_index(ctx, "firewall.@zone", 7, nullptr, "zone"), -1);
@@ -545,7 +549,7 @@ TEST_F(Uci, ASectionThatIsNotThereIsNotMadeUnderItsIndex)
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
-TEST_F(Uci, AnEqualsSignInAPathWritesNothing)
+TEST_F(Uci, an_equals_sign_in_a_path_writes_nothing)
 {
     const std::string log = support::log_of([&] {
         EXPECT_EQ(support::in_child([&] {
@@ -562,7 +566,7 @@ TEST_F(Uci, AnEqualsSignInAPathWritesNothing)
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
-TEST_F(Uci, APackageIsNeitherSetRenamedNorDeleted)
+TEST_F(Uci, a_package_is_neither_set_renamed_nor_deleted)
 {
     EXPECT_EQ(support::in_child([&] {
                   EXPECT_EQ(uci2_set(ctx, "firewall", "x"), -1);
@@ -575,7 +579,7 @@ TEST_F(Uci, APackageIsNeitherSetRenamedNorDeleted)
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
-TEST_F(Uci, AFailedLookUpIsNotLogged)
+TEST_F(Uci, a_failed_look_up_is_not_logged)
 {
     EXPECT_EQ(support::log_of([&] {
                   got("firewall.webdav_wan.missing", -1);
@@ -585,7 +589,7 @@ TEST_F(Uci, AFailedLookUpIsNotLogged)
               "");
 }
 
-TEST_F(Uci, ResettingTheTypeListDoesNothing)
+TEST_F(Uci, resetting_the_type_list_does_nothing)
 {
     uci2_reset_typelist();
     EXPECT_EQ(got("firewall.webdav_wan.target"), "ACCEPT");
