@@ -5,59 +5,16 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "log/log.h"
+#include "config/config_path.h"
 #include "util/guard.h"
 #include "util/text.h"
 
 namespace {
 
-constexpr size_t UCI_PATH_SIZE = 128;
 constexpr size_t SPLIT_SIZE = 100;
 constexpr char SECTION_DELIMITERS[] = ".@";
 constexpr char OPTION_DELIMITERS[] = ".";
-constexpr char NAME_CHARACTERS[] = "abcdefghijklmnopqrstuvwxyz"
-                                   "ABCDEFGHIJKLMNOPQRSTUVWXYZ"
-                                   "0123456789_";
-
 using context_guard = guard<uci_context*, nullptr, uci_free_context>;
-
-// A private copy of a path: the library writes into the text that it parses, and its look-up result
-// points into it.
-struct path_copy {
-    text_guard text;
-
-    explicit path_copy(const char* path) : text(path != nullptr ? strdup(path) : nullptr) {}
-    path_copy(const char* path, const char* value)
-        : text(path != nullptr && value != nullptr ? text_join(path, "=", value) : nullptr)
-    {
-    }
-};
-
-bool look_up(uci_context* ctx, const path_copy& path, uci_ptr* ptr)
-{
-    if (ctx == nullptr || path.text == nullptr) {
-        return false;
-    }
-    memset(ptr, 0, sizeof(*ptr));
-    return uci_lookup_ptr(ctx, ptr, path.text, true) == UCI_OK;
-}
-
-bool is_complete(const uci_ptr& ptr)
-{
-    return (ptr.flags & uci_ptr::UCI_LOOKUP_COMPLETE) != 0;
-}
-
-bool look_up_complete(uci_context* ctx, const path_copy& path, uci_ptr* ptr)
-{
-    if (!look_up(ctx, path, ptr)) {
-        return false;
-    }
-    if (!is_complete(*ptr)) {
-        ctx->err = UCI_ERR_NOTFOUND;
-        return false;
-    }
-    return true;
-}
 
 // The elements of a library list, one after the other; null after the last.
 uci_element* first_element(uci_list* list)
@@ -101,103 +58,24 @@ const char* value_text(const uci_ptr& ptr)
     }
 }
 
-// What the library would not survive, or could not read again once it is written.
-bool refuse(const char* reason, const char* path)
-{
-    log_err("uci %s, path = %s\n", reason, path != nullptr ? path : "");
-    return false;
-}
-
-// One character more than a path may have, so that one which is too long shows.
-using built_path = char[UCI_PATH_SIZE + 1];
-
-// A path that was cut would name another option.
-bool is_whole(const built_path& path)
-{
-    return strlen(path) < UCI_PATH_SIZE || refuse("path too long", path);
-}
-
-bool index_path(built_path& out, const char* type, int index, const char* option)
-{
-    if (type == nullptr) {
-        return refuse("type missing", option);
-    }
-    if (option != nullptr) {
-        text_format(out, "%s[%d].%s", type, index, option);
-    } else {
-        text_format(out, "%s[%d]", type, index);
-    }
-    return is_whole(out);
-}
-
-bool name_path(built_path& out, const char* package, const char* section, const char* option)
-{
-    if (package == nullptr || section == nullptr) {
-        return refuse("name missing", option);
-    }
-    if (option != nullptr) {
-        text_format(out, "%s.%s.%s", package, section, option);
-    } else {
-        text_format(out, "%s.%s", package, section);
-    }
-    return is_whole(out);
-}
-
-bool is_name(const char* text)
-{
-    return text[0] != '\0' && text[strspn(text, NAME_CHARACTERS)] == '\0';
-}
-
-// The library takes more for a type, and writes it without quotes.
-bool is_type(const char* text)
-{
-    for (const char* c = text; *c != '\0'; ++c) {
-        if (*c <= ' ' || *c > '~' || strchr("'\"\\#;", *c) != nullptr) {
-            return false;
-        }
-    }
-    return text[0] != '\0';
-}
-
-using library_call = int (*)(uci_context*, uci_ptr*);
-
-// May the call be made of what the path was found to name? The library itself asks less.
-bool is_sound(library_call call, const uci_ptr& ptr, const char* path)
-{
-    if (call == uci_rename) {
-        return is_name(ptr.value) || refuse("name not valid", path);
-    }
-    if ((call == uci_add_list || call == uci_del_list) && ptr.option == nullptr) {
-        return refuse("option missing", path);
-    }
-    if (call != uci_set || ptr.option != nullptr || ptr.section == nullptr) {
-        return true;
-    }
-    // A section is set: its value is its type, and one that is not there yet gets its name from the
-    // path. An empty value deletes.
-    if (ptr.value[0] != '\0' && !is_type(ptr.value)) {
-        return refuse("type not valid", path);
-    }
-    return ptr.s != nullptr || is_name(ptr.section) || refuse("name not valid", path);
-}
-
 // Looks the path up and makes the call. A path with a "=" would end there for the library.
 bool change(uci_context* ctx, uci_ptr* ptr, const char* path, const path_copy& copy,
-            library_call call)
+            config_call call)
 {
     if (path != nullptr && strchr(path, '=') != nullptr) {
-        return refuse("path not valid", path);
+        return config_refuse("path not valid", path);
     }
-    return look_up(ctx, copy, ptr) && is_sound(call, *ptr, path) && call(ctx, ptr) == UCI_OK;
+    return config_look_up(ctx, copy, ptr) && config_call_is_sound(call, *ptr, path) &&
+           call(ctx, ptr) == UCI_OK;
 }
 
-int change_unsaved(uci_context* ctx, const char* path, const char* value, library_call call)
+int change_unsaved(uci_context* ctx, const char* path, const char* value, config_call call)
 {
     uci_ptr ptr;
     return change(ctx, &ptr, path, path_copy(path, value), call) ? 0 : -1;
 }
 
-int change_and_save(uci_context* ctx, const char* path, const path_copy& copy, library_call call)
+int change_and_save(uci_context* ctx, const char* path, const path_copy& copy, config_call call)
 {
     uci_ptr ptr;
     return change(ctx, &ptr, path, copy, call) && uci_save(ctx, ptr.p) == UCI_OK ? 0 : -1;
@@ -207,7 +85,7 @@ uci_package* look_up_package(uci_context* ctx, const char* name)
 {
     const path_copy path(name);
     uci_ptr ptr;
-    return look_up(ctx, path, &ptr) ? ptr.p : nullptr;
+    return config_look_up(ctx, path, &ptr) ? ptr.p : nullptr;
 }
 
 // The list that a path names, null when it names none.
@@ -215,7 +93,7 @@ uci_list* look_up_list(uci_context* ctx, const char* path)
 {
     const path_copy copy(path);
     uci_ptr ptr;
-    if (!look_up_complete(ctx, copy, &ptr) || ptr.o == nullptr) {
+    if (!config_look_up_complete(ctx, copy, &ptr) || ptr.o == nullptr) {
         return nullptr;
     }
     return ptr.o->type == UCI_TYPE_LIST ? &ptr.o->v.list : nullptr;
@@ -268,7 +146,7 @@ int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
     text_copy({out, size}, "");
     const path_copy copy(path);
     uci_ptr ptr;
-    if (!look_up_complete(ctx, copy, &ptr)) {
+    if (!config_look_up_complete(ctx, copy, &ptr)) {
         return -1;
     }
     text_copy({out, size}, value_text(ptr));
@@ -278,15 +156,17 @@ int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
 int uci2_get_by_index(uci_context* ctx, const char* type, int index, const char* option, char* out,
                       size_t size)
 {
-    built_path path;
-    return uci2_get(ctx, index_path(path, type, index, option) ? path : nullptr, out, size);
+    config_path path;
+    return uci2_get(ctx, config_path_by_index(path, type, index, option) ? path : nullptr, out,
+                    size);
 }
 
 int uci2_get_by_name(uci_context* ctx, const char* package, const char* section, const char* option,
                      char* out, size_t size)
 {
-    built_path path;
-    return uci2_get(ctx, name_path(path, package, section, option) ? path : nullptr, out, size);
+    config_path path;
+    return uci2_get(ctx, config_path_by_name(path, package, section, option) ? path : nullptr, out,
+                    size);
 }
 
 int uci2_set(uci_context* ctx, const char* path, const char* value)
@@ -297,15 +177,15 @@ int uci2_set(uci_context* ctx, const char* path, const char* value)
 int uci2_set_by_index(uci_context* ctx, const char* type, int index, const char* option,
                       const char* value)
 {
-    built_path path;
-    return index_path(path, type, index, option) ? uci2_set(ctx, path, value) : -1;
+    config_path path;
+    return config_path_by_index(path, type, index, option) ? uci2_set(ctx, path, value) : -1;
 }
 
 int uci2_set_by_name(uci_context* ctx, const char* package, const char* section, const char* option,
                      const char* value)
 {
-    built_path path;
-    return name_path(path, package, section, option) ? uci2_set(ctx, path, value) : -1;
+    config_path path;
+    return config_path_by_name(path, package, section, option) ? uci2_set(ctx, path, value) : -1;
 }
 
 int uci2_rename(uci_context* ctx, const char* path, const char* new_name)
@@ -332,7 +212,7 @@ int uci2_commit(uci_context* ctx, const char* package)
 {
     const path_copy path(package);
     uci_ptr ptr;
-    const bool done = look_up(ctx, path, &ptr) && uci_commit(ctx, &ptr.p, false) == UCI_OK;
+    const bool done = config_look_up(ctx, path, &ptr) && uci_commit(ctx, &ptr.p, false) == UCI_OK;
     // Routers lose power without notice.
     sync();
     return done ? 0 : 1;
@@ -340,8 +220,8 @@ int uci2_commit(uci_context* ctx, const char* package)
 
 int uci2_add_section(const char* package, const char* type)
 {
-    if (package == nullptr || type == nullptr || !is_type(type)) {
-        refuse("type not valid", package);
+    if (package == nullptr || type == nullptr || !config_type_is_sound(type)) {
+        config_refuse("type not valid", package);
         return -1;
     }
     const context_guard ctx(uci_alloc_context());
@@ -381,13 +261,13 @@ int uci2_count_type(uci_context* ctx, const char* package_and_type)
 
 uci_section* uci2_get_section(uci_context* ctx, const char* type, int index)
 {
-    built_path path;
-    if (!index_path(path, type, index, nullptr)) {
+    config_path path;
+    if (!config_path_by_index(path, type, index, nullptr)) {
         return nullptr;
     }
     const path_copy copy(path);
     uci_ptr ptr;
-    return look_up_complete(ctx, copy, &ptr) ? ptr.s : nullptr;
+    return config_look_up_complete(ctx, copy, &ptr) ? ptr.s : nullptr;
 }
 
 const char* uci2_find_section(uci_context* ctx, const char* path, const char* value)

@@ -256,6 +256,9 @@ int disk_obj_refresh_sizes(disk_obj* disk)
 
 void disk_obj_dump(const disk_obj* disk)
 {
+    if (disk == nullptr) {
+        return;
+    }
     log_info("disk obj:\n");
     part_info_dump(&disk->root);
     for (const part_slot& slot : disk->parts) {

@@ -104,6 +104,8 @@ bool publish(const char* path, const char* text)
 
 void disk_sets_publish(disk_sets* sets)
 {
+    // A disk that waits for its first mount pass counts as empty and goes too: docs/limits.md,
+    // "Coming and going".
     disk_sets_clear_empty(sets);
     disk_status_write_json(sets);
     disk_status_write_count(sets);

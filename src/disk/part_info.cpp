@@ -106,12 +106,15 @@ void part_info_refresh_free(part_info* part)
 
 bool part_info_is_valid(const part_info* part)
 {
-    return part->dev_name[0] != '\0' && part->disk_name[0] != '\0' && part->total_len != 0 &&
-           part->free_size <= part->total_len;
+    return part != nullptr && part->dev_name[0] != '\0' && part->disk_name[0] != '\0' &&
+           part->total_len != 0 && part->free_size <= part->total_len;
 }
 
 void part_info_dump(const part_info* part)
 {
+    if (part == nullptr) {
+        return;
+    }
     log_info("%s", DUMP_RULE);
     log_info("uid = %s\n", part->uid);
     log_info("dev name = %s\n", part->dev_name);

@@ -287,3 +287,8 @@ TEST_F(DiskObj, a_null_disk_is_answered_with_1_or_nothing)
     EXPECT_EQ(disk_obj_read_sizes(nullptr), 1);
     EXPECT_EQ(disk_obj_refresh_sizes(nullptr), 1);
 }
+
+TEST_F(DiskObj, no_disk_is_dumped_as_nothing)
+{
+    EXPECT_EQ(support::log_of([] { disk_obj_dump(nullptr); }), "");
+}

@@ -270,3 +270,9 @@ TEST_F(PartInfo, a_dump_without_a_root_leaves_its_line_out)
     EXPECT_FALSE(contains(log, "ref root dev name"));
     EXPECT_TRUE(contains(log, "fs type = ERR FS\n"));
 }
+
+TEST_F(PartInfo, no_record_is_not_valid_and_is_dumped_as_nothing)
+{
+    EXPECT_FALSE(part_info_is_valid(nullptr));
+    EXPECT_EQ(support::log_of([] { part_info_dump(nullptr); }), "");
+}

@@ -391,10 +391,10 @@ TEST_F(Uci, a_section_without_package_or_type_is_refused)
                   }),
                   0);
     });
-    EXPECT_EQ(log, "ERROR[uci2.cpp:N]uci type not valid, path = firewall\n"
-                   "ERROR[uci2.cpp:N]uci type not valid, path = \n"
-                   "ERROR[uci2.cpp:N]uci type not valid, path = \n"
-                   "ERROR[uci2.cpp:N]uci type not valid, path = firewall\n");
+    EXPECT_EQ(log, "ERROR[config_path.cpp:N]uci type not valid, path = firewall\n"
+                   "ERROR[config_path.cpp:N]uci type not valid, path = \n"
+                   "ERROR[config_path.cpp:N]uci type not valid, path = \n"
+                   "ERROR[config_path.cpp:N]uci type not valid, path = firewall\n");
     EXPECT_EQ(on_disk(), FIREWALL);
 }
 
@@ -413,7 +413,7 @@ TEST_F(Uci, a_path_of_127_characters_is_taken_and_a_longer_one_never_cut)
         EXPECT_EQ(uci2_set_by_name(ctx, "firewall", "webdav_wan", longer.c_str(), "long"), -1);
     });
     EXPECT_STREQ(out, "");
-    EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci path too long, path = firewall.webdav_wan.ooo"),
+    EXPECT_EQ(count_of(log, "ERROR[config_path.cpp:N]uci path too long, path = firewall.webdav_wan.ooo"),
               2);
     EXPECT_EQ(got(("firewall.webdav_wan." + option).c_str()), "short");
 
@@ -447,7 +447,7 @@ TEST_F(Uci, without_a_type_or_name_there_is_no_path)
         EXPECT_EQ(uci2_get_section(ctx, nullptr, 0), nullptr);
     });
     EXPECT_STREQ(out, "");
-    EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci "), 5) << log;
+    EXPECT_EQ(count_of(log, "ERROR[config_path.cpp:N]uci "), 5) << log;
     EXPECT_EQ(uci2_get(ctx, "firewall.webdav_wan.port", nullptr, 8), -1);
     EXPECT_EQ(uci2_list_item(ctx, "firewall.webdav_wan.proto", 0, nullptr, 8), 0);
 }
@@ -466,7 +466,7 @@ TEST_F(Uci, a_list_needs_an_option)
                       0)
                 << path;
         });
-        EXPECT_EQ(count_of(log, "ERROR[uci2.cpp:N]uci option missing, path = "), 2) << log;
+        EXPECT_EQ(count_of(log, "ERROR[config_path.cpp:N]uci option missing, path = "), 2) << log;
         EXPECT_EQ(read_afresh("firewall.webdav_wan"), "rule");
         EXPECT_EQ(read_afresh("firewall.webdav_wan.port"), "8080");
     }
