@@ -50,6 +50,17 @@ void log_root_fs(const disk_obj* disk)
     log_info("root part fs = %s\n", fs_type_name(disk->root.fs_type));
 }
 
+// An earlier walk that broke off may have taken the partition in.
+bool has_slot(const disk_obj* disk, const char* dev_name)
+{
+    for (const part_slot& slot : disk->parts) {
+        if (slot.in_use == 1 && str_equal(slot.part.dev_name, dev_name) == MATCHES) {
+            return true;
+        }
+    }
+    return false;
+}
+
 // True, which is logged, when the disk is none for users.
 bool is_kept_out(const char* root_dev)
 {
@@ -174,14 +185,19 @@ void disk_obj_scan_parts(disk_obj* disk)
     char path[PATH_SIZE];
     path_sys_disk(path, disk->root.dev_name);
     log_info("check path = %s\n", path);
-    dir_stream dir(path);
-    if (dir.stream == nullptr) {
-        log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return;
-    }
-    while (const char* name = dir.next_name()) {
-        if (dev_name_is_disk(name) == MATCHES) {
-            disk_obj_add_sub_part(disk, name);
+    for (int walk = 0; walk < DIR_WALKS; ++walk) {
+        dir_stream dir(path);
+        if (dir.stream == nullptr) {
+            log_err("open dir err, dir = %s\n", SYS_BLOCK);
+            return;
+        }
+        while (const char* name = dir.next_name()) {
+            if (dev_name_is_disk(name) == MATCHES && !has_slot(disk, name)) {
+                disk_obj_add_sub_part(disk, name);
+            }
+        }
+        if (!dir.failed) {
+            return;
         }
     }
 }

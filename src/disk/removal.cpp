@@ -12,9 +12,6 @@
 
 namespace {
 
-// Someone is about to pull the disks: a look that broke off is repeated.
-constexpr int SYS_BLOCK_WALKS = 3;
-
 void umount_until_gone(const char* dev_path)
 {
     char mounted_at[MOUNT_PATH_SIZE]{};
@@ -160,7 +157,7 @@ int safe_remove_all(disk_sets* sets)
     if (sets == nullptr) {
         return 1;
     }
-    for (int i = 0; i < SYS_BLOCK_WALKS; ++i) {
+    for (int walk = 0; walk < DIR_WALKS; ++walk) {
         dir_stream dir(SYS_BLOCK);
         if (dir.stream == nullptr) {
             log_err("open dir err, dir = %s\n", SYS_BLOCK);

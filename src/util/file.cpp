@@ -57,14 +57,19 @@ int dir_has_entry(const char* path, const char* name)
     if (path == nullptr || name == nullptr) {
         return NO_MATCH;
     }
-    dir_stream dir(path);
-    if (dir.stream == nullptr) {
-        log_err("open dir err, dir = %s\n", path);
-        return NO_MATCH;
-    }
-    while (const char* entry = dir.next_name()) {
-        if (str_equal(entry, name) == MATCHES) {
-            return MATCHES;
+    for (int walk = 0; walk < DIR_WALKS; ++walk) {
+        dir_stream dir(path);
+        if (dir.stream == nullptr) {
+            log_err("open dir err, dir = %s\n", path);
+            return NO_MATCH;
+        }
+        while (const char* entry = dir.next_name()) {
+            if (str_equal(entry, name) == MATCHES) {
+                return MATCHES;
+            }
+        }
+        if (!dir.failed) {
+            break;
         }
     }
     return NO_MATCH;

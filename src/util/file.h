@@ -27,6 +27,10 @@ struct dir_stream {
     const char* next_name();
 };
 
+// How often a directory is walked when reading breaks off, for want of memory say. An entry that was
+// only not reached must not count as one that is not there.
+constexpr int DIR_WALKS = 3;
+
 // True when something exists at path.
 [[nodiscard]] bool path_exists(const char* path);
 

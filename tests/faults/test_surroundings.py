@@ -257,3 +257,16 @@ def test_a_list_of_disks_that_breaks_off_at_start_is_looked_at_again_without_an_
     assert "d_name = sda" not in daemon.log()[:daemon.log().index("have disk = ")]
     world.wait(starts.is_right, 30, "the disk in disk.json")
     assert daemon.stop() == 0
+
+
+def test_a_list_of_partitions_that_breaks_off_is_read_again(starts):
+    world = starts.world
+    daemon = world.start_daemon(environ=starts.environ, held=True)
+    folder = world.run("readlink", "-f", "/sys/block/sda").stdout.strip()
+    with Strace(daemon, ["getdents64"], "error=EIO:when=1", paths=[folder]) as strace:
+        daemon.release()
+        daemon.wait_log("read dir err")
+        daemon.wait_started()
+    assert strace.injected == 1
+    world.wait(starts.is_right, 30, "the disk in disk.json")
+    assert daemon.stop() == 0
