@@ -3,6 +3,7 @@
 import subprocess
 
 import pytest
+from shared.busy import hold
 
 from world import Partition
 
@@ -170,8 +171,7 @@ def test_a_busy_partition_gets_ten_further_unmounts_and_is_forgotten_with_the_se
     world.plug(world.partitioned_disk(Partition("ext4", 1200), Partition("ext4", 1100)), "sda")
     daemon = start_daemon()
     world.wait(lambda: len(world.parts()) == 2, 30, "two partitions in disk.json")
-    # The world's end takes it down with all the others.
-    world.sh("cd /tmp/mountd/disk1_part1 && sleep 300 >/dev/null 2>&1 &")
+    hold(world, "/tmp/mountd/disk1_part1")
     daemon.wait_rescan()
     world.tools.clear_logs()
     mark = daemon.mark()

@@ -5,6 +5,7 @@ import stat
 import time
 
 import pytest
+from shared.busy import hold
 
 from world import Partition
 from world.state import DISK_DB, PID_FILE
@@ -208,8 +209,7 @@ def test_a_pulled_disk_that_a_process_keeps_busy_leads_to_a_restart(world, start
     daemon = start_daemon()
     daemon.wait_log("mount OK, /dev/sda1 ==> /tmp/mountd/disk1_part1")
     daemon.wait_rescan()
-    # The world's end takes it down with all the others.
-    world.sh("cd /tmp/mountd/disk1_part1 && sleep 300 >/dev/null 2>&1 &")
+    hold(world, "/tmp/mountd/disk1_part1")
 
     world.hotunplug(disk)
     daemon.wait_log("dev not find, dev = /dev/sda1", 90)

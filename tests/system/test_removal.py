@@ -1,6 +1,7 @@
 """Removal of partitions and disks, by event, by pulling and all at once."""
 
 import pytest
+from shared.busy import END_HOLDER, hold
 from shared.moments import first_rescan_over, quiet_moment
 from shared.published import directories, wait_directories, wait_mounted
 
@@ -12,10 +13,10 @@ SERVICES = ["samba4", "nas_samba3", "tarn_nas_sys_dl", "tarn_nas_sys_up"]
 STOPPED = [(name, "stop") for name in SERVICES]
 STARTED = [(name, "start") for name in SERVICES]
 # A service that works on the shared files as long as it runs.
-_FILE_SERVER = """#!/bin/sh
+_FILE_SERVER = f"""#!/bin/sh
 echo "samba4 $1 0" >> /run/world/services.log
-[ "$1" = stop ] && kill -9 "$(cat /run/server.pid)"
-exit 0
+[ "$1" = stop ] || exit 0
+{END_HOLDER}
 """
 
 
@@ -35,14 +36,6 @@ def commands(log):
 
 def mountd_flags(world):
     return {row["dev_name"]: row["mountd"] for row in world.db_rows()}
-
-
-def hold(world, path):
-    """A process that keeps a mount busy; returns its Popen."""
-    process = world.popen("/bin/sh", "-c",
-                          f"echo $$ > /run/server.pid; cd {path} && exec sleep 600")
-    world.wait(lambda: world.run("pgrep", "-x", "sleep", check=False).stdout, 30, "the sleeper")
-    return process
 
 
 def test_a_mounted_partition_is_removed_while_the_services_that_use_it_are_stopped(
