@@ -160,6 +160,7 @@ def unmounted(world, *devices, timeout=20):
              f"{devices} to be unmounted")
 
 
+@pytest.mark.takes_minutes
 def test_the_real_daemon_removes_a_partition_a_disk_and_all(world, plugin):
     disk = world.partitioned_disk(*(Partition("ext4", 1200, f"PART{number}") for number in (1, 2, 3)))
     stick, card = world.whole_disk("ext4", 1200), world.partitioned_disk(Partition("ext4", 1200))

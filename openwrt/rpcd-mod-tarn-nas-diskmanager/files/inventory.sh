@@ -16,8 +16,8 @@ SMALL_PART_MAX_MIB=999
 # The daemon's buffers take 31 characters of a name in a message.
 MAX_NAME=31
 
-# The status file is truncated and written in place: a reader may find it empty or cut off for a moment.
-# It is read again at once, and then after whole seconds, as not every busybox counts others.
+# The daemon renames a whole status file into place; who writes it in another way may be halfway through. What is no
+# document is read again, at once and then after whole seconds, as not every busybox counts others.
 STATUS_TRIES=5
 STATUS_TRIES_AT_ONCE=3
 
@@ -295,7 +295,7 @@ reason_of_listed() {
 reason_of_unlisted() {
 	if mounts_of "$1"; then
 		reason=elsewhere
-		# Taken out of the list, but a file on it was in use.
+		# Not yet in the list, or taken out of it while a file was in use.
 		case "$mounts" in
 			*" $MOUNT_BASE"/*) reason=busy ;;
 		esac
