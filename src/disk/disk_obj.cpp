@@ -64,6 +64,8 @@ int disk_obj_set_root(disk_obj* disk, const char* dev_name)
     disk->root.is_root_part = 1;
     disk->root.ref_root = &disk->root;
     text_copy(disk->root.dev_name, dev_name);
+    // Before anything is read: when the disk is replaced meanwhile, what was read is the old one's.
+    disk->node_id = dev_node_id(dev_name);
     part_info_fill(&disk->root);
     log_info("=== ===> set root part(%s), ref disk dev name = %s\n", disk->root.dev_name,
              disk->root.ref_root->dev_name);

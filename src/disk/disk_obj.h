@@ -20,6 +20,7 @@ struct disk_obj {
     part_info root;                  // the whole disk
     part_slot parts[MAX_SUB_PARTS];  // its partitions
     int32_t sd_card;                 // 1 when it is the router's SD card
+    uint64_t node_id;                // dev_node_id when it was taken in: which disk had the name
 };
 
 // Makes the root record of a disk and fills it from the device.

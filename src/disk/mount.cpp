@@ -3,6 +3,7 @@
 #include "disk/disk_db.h"
 #include "disk/mount_point.h"
 #include "disk/mount_table.h"
+#include "disk/pulled.h"
 #include "fs/fs_type.h"
 #include "log/log.h"
 #include "util/command.h"
@@ -50,6 +51,24 @@ bool wait_until_mounted(const char* dev_path)
     for (int i = 0; i < MOUNT_WAIT_TRIES; ++i) {
         pause_seconds(MOUNT_WAIT_SECONDS);
         if (is_dev_mounted(dev_path) == YES) {
+            return true;
+        }
+    }
+    return false;
+}
+
+bool is_to_be_mounted(const part_info* part)
+{
+    return part->mount_status == 0 && fs_mount_cmd_format(part->fs_type) != nullptr;
+}
+
+bool has_part_to_mount(const disk_obj* disk)
+{
+    if (disk->root.fs_type != FS_NONE && is_to_be_mounted(&disk->root)) {
+        return true;
+    }
+    for (const part_slot& slot : disk->parts) {
+        if (slot.in_use == 1 && is_to_be_mounted(&slot.part)) {
             return true;
         }
     }
@@ -124,6 +143,11 @@ int mount_disk_sets(disk_sets* sets)
     }
     log_info("*** *** *** mount path\n");
     for (disk_entry& entry : sets->entries) {
+        // The disk before may have been waited for long enough for others to leave. A directory
+        // that a pulled disk still occupies would look taken to the same disk under another name.
+        if (entry.in_use == 1 && has_part_to_mount(&entry.disk)) {
+            forget_pulled_disks(sets);
+        }
         if (entry.in_use == 1) {
             number_sub_parts(&entry.disk);
             mount_root_part(&entry.disk);

@@ -1,7 +1,5 @@
 #include "disk/mount_point.h"
 
-#include <cerrno>
-
 #include "disk/mount_table.h"
 #include "log/log.h"
 #include "util/file.h"
@@ -79,13 +77,6 @@ bool read_for_check(mount_table* table)
 void log_mount(const mount_entry* entry)
 {
     log_info("%s ===> %s\n", entry->dev, entry->path);
-}
-
-// Only a node that is not there is gone. One that cannot be looked at for a moment, for want of
-// memory say, must not cost the database.
-bool node_is_gone(const char* dev_path)
-{
-    return !path_exists(dev_path) && (errno == ENOENT || errno == ENOTDIR);
 }
 
 }  // namespace
@@ -220,7 +211,8 @@ int check_mount_dev_exist()
     for (int i = 0; i < table.num; ++i) {
         const char* dev_path = table.entries[i].dev;
         log_info("check mount dev err, dev[%d] = %s\n", i, dev_path);
-        if (node_is_gone(dev_path)) {
+        // One that cannot be looked at must not cost the database.
+        if (path_is_gone(dev_path)) {
             log_warn("dev not find, dev = %s\n", dev_path);
             return 1;
         }

@@ -1,5 +1,5 @@
-// Unmounting and forgetting partitions and disks. A name is a kernel device name (dev_name), that of
-// a whole disk (root_dev), or a directory name below the mount base (dir_name).
+// Unmounting and forgetting partitions and disks. A name is a kernel device name (dev_name), that
+// of a whole disk (root_dev), or a directory name below the mount base (dir_name).
 #pragma once
 
 #include "disk/disk_sets.h"

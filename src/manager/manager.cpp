@@ -6,9 +6,11 @@
 #include "disk/disk_status.h"
 #include "disk/mount.h"
 #include "disk/mount_point.h"
+#include "disk/pulled.h"
 #include "disk/removal.h"
 #include "log/log.h"
 #include "manager/rescan.h"
+#include "manager/self_check.h"
 #include "manager/services.h"
 #include "util/block_dev.h"
 #include "util/file.h"
@@ -112,6 +114,8 @@ int on_add(disk_manager* manager, const char* dev_name)
     manager->state = MANAGER_ACTIVE;
     manager->changed = 1;
     manager->update_due = 1;
+    // An old record would make the inventory refuse the new disk of its name.
+    forget_replaced_disks(&manager->disks);
     return disk_sets_add_dev(&manager->disks, dev_name);
 }
 
@@ -140,6 +144,8 @@ int on_safe_remove(disk_manager* manager)
     log_info("===> safe remove disk\n");
     services_stop();
     safe_remove_all(&manager->disks);
+    // That goes through what the kernel lists; nobody looks for the others while parked.
+    forget_pulled_disks(&manager->disks);
     services_start();
     disk_sets_publish(&manager->disks);
     // docs/limits.md, "After a safe removal only disks that are plugged or announced again come
@@ -163,15 +169,21 @@ void publish_when_due(disk_manager* manager, time_t now)
     }
 }
 
-// Two mounts in one place, or a mount without its device: the daemon's memory cannot be trusted. It
-// starts again with a fresh database. Both are looked for, since each logs what it finds.
-void check_mount_consistency()
+void rescan(disk_manager* manager)
 {
-    const bool path_twice = check_mount_path_dup() == YES;
-    const bool dev_gone = check_mount_dev_exist() == YES;
-    if (!path_twice && !dev_gone) {
-        return;
+    int32_t came_or_went = 0;
+    // A list that could not be read is tried again next time. The mounts can be checked without it.
+    static_cast<void>(rescan_block_devices(&manager->disks, &came_or_went));
+    if (came_or_went == 1) {
+        manager->changed = 1;
+        // A publication before its first mount pass would drop a new disk as empty.
+        manager->update_due = 1;
     }
+}
+
+// The memory of places cannot be trusted: the daemon starts again with a fresh database.
+void start_afresh()
+{
     file_delete(DISK_DB_FILE);
     running = 0;
     restart_requested = 1;
@@ -190,16 +202,20 @@ void do_periodic_work(disk_manager* manager)
     if (now - manager->t_update >= UPDATE_EVERY_SECONDS || manager->update_due == 1) {
         manager->t_update = now;
         manager->update_due = 0;
+        const int before = disk_sets_count(&manager->disks);
         mount_all(&manager->disks);
+        // The pass forgets disks that were pulled.
+        manager->changed |= disk_sets_count(&manager->disks) != before ? 1 : 0;
     }
     publish_when_due(manager, now);
     if (now - manager->t_rescan < RESCAN_EVERY_SECONDS) {
         return;
     }
     manager->t_rescan = now;
-    // A list that could not be read is tried again next time. The mounts can be checked without it.
-    static_cast<void>(rescan_block_devices(&manager->disks, &manager->changed));
-    check_mount_consistency();
+    rescan(manager);
+    if (!self_check(&manager->disks, &manager->changed)) {
+        start_afresh();
+    }
 }
 
 // The first mount pass, of what a start-up scan has found.
@@ -325,7 +341,7 @@ int manager_dispatch(disk_manager* manager)
         case EVENT_DISK_ADD:
             return on_add(manager, name);
         case EVENT_DISK_REMOVE_DEV:
-            return on_remove(manager, name, remove_dev);
+            return on_remove(manager, name, remove_told_dev);
         case EVENT_DISK_REMOVE_DISK:
             return on_remove(manager, name, remove_disk);
         case EVENT_DISK_SAFE_REMOVE:

@@ -3,7 +3,7 @@
 #include <cstddef>
 
 #include "disk/discovery.h"
-#include "disk/removal.h"
+#include "disk/pulled.h"
 #include "log/log.h"
 #include "util/block_dev.h"
 #include "util/file.h"
@@ -15,18 +15,23 @@ namespace {
 constexpr int BLOCK_LIST_SIZE = 16;
 constexpr size_t BLOCK_NAME_SIZE = 16;
 
-struct block_names {
-    char names[BLOCK_LIST_SIZE][BLOCK_NAME_SIZE];
+struct block_slot {
+    char name[BLOCK_NAME_SIZE];
+    uint64_t node_id;  // dev_node_id
+};
+
+struct block_slots {
+    block_slot slots[BLOCK_LIST_SIZE];
 };
 
 // What lasts as long as the process: the devices seen at the previous rescan. The start-up scan
 // leaves it empty, so that the first rescan offers every disk again; the inventory ignores those
 // that it holds.
-block_names block_list;
+block_slots block_list;
 
 // Longer names are cut. More names than slots are left for the rescan that finds room:
 // docs/limits.md, "Rescans hold 16 block devices".
-bool read_block_names(block_names* list)
+bool read_block_slots(block_slots* list)
 {
     dir_stream dir(SYS_BLOCK);
     if (dir.stream == nullptr) {
@@ -36,46 +41,62 @@ bool read_block_names(block_names* list)
     int used = 0;
     while (const char* name = dir.next_name()) {
         if (dev_name_is_disk(name) == MATCHES && used < BLOCK_LIST_SIZE) {
-            text_copy(list->names[used++], name);
+            block_slot* slot = &list->slots[used++];
+            text_copy(slot->name, name);
+            slot->node_id = dev_node_id(name);
         }
     }
     // Half a list would take the disks that it lacks for pulled ones.
     return !dir.failed;
 }
 
-bool holds(const block_names& list, const char* name)
+const block_slot* find_slot(const block_slots& list, const char* name)
 {
-    for (const auto& slot : list.names) {
-        if (str_equal(slot, name) == MATCHES) {
-            return true;
+    for (const block_slot& slot : list.slots) {
+        if (str_equal(slot.name, name) == MATCHES) {
+            return &slot;
         }
     }
-    return false;
+    return nullptr;
+}
+
+// Another disk under the name of one that was listed is new. Without its node nobody can tell.
+bool is_new(const block_slot& found)
+{
+    const block_slot* known = find_slot(block_list, found.name);
+    return known == nullptr || (found.node_id != 0 && found.node_id != known->node_id);
 }
 
 }  // namespace
 
 bool rescan_block_devices(disk_sets* disks, int32_t* changed)
 {
-    block_names found{};
-    if (!read_block_names(&found)) {
+    block_slots found{};
+    if (!read_block_slots(&found)) {
         return false;
     }
+    // An old record would make the inventory refuse the new disk of its name.
+    bool any = forget_replaced_disks(disks);
     // Empty slots are compared like names on purpose: when a full list shrinks, "" is offered once,
     // and no device is called that.
-    for (const auto& name : found.names) {
-        if (!holds(block_list, name)) {
-            disk_sets_add_dev(disks, name);
-            *changed = 1;
+    for (const block_slot& slot : found.slots) {
+        if (is_new(slot)) {
+            disk_sets_add_dev(disks, slot.name);
+            any = true;
         }
     }
-    for (const auto& name : block_list.names) {
-        if (!holds(found, name)) {
-            remove_root_part(disks, name);
-            *changed = 1;
+    for (const block_slot& slot : block_list.slots) {
+        if (find_slot(found, slot.name) == nullptr) {
+            remove_pulled_disk(disks, slot.name);
+            any = true;
         }
     }
     block_list = found;
+    // Those that came and went between two rescans, so that no list ever held them.
+    any |= forget_pulled_disks(disks);
+    if (any) {
+        *changed = 1;
+    }
     return true;
 }
 

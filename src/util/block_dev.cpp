@@ -1,5 +1,6 @@
 #include "util/block_dev.h"
 
+#include <sys/stat.h>
 #include <sys/vfs.h>
 
 #include <cstdio>
@@ -106,6 +107,14 @@ int sys_block_find_parent(const char* part_name, char* out, size_t size)
         }
     }
     return NO_MATCH;
+}
+
+uint64_t dev_node_id(const char* dev_name)
+{
+    char path[PATH_SIZE];
+    path_dev_node(path, dev_name);
+    struct stat node {};
+    return stat(path, &node) == 0 ? node.st_ino : 0;
 }
 
 void dev_get_sectors(const char* disk_name, const char* dev_name, uint64_t* sectors)

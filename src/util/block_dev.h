@@ -18,6 +18,11 @@ int sys_block_has_dev(const char* name);
 // NO_MATCH.
 int sys_block_find_parent(const char* part_name, char* out, size_t size);
 
+// Tells one device from the next that gets its name: the inode number of its node, which is made
+// anew for each. (The kernel hands out device numbers again with the names.) 0 when the node cannot
+// be looked at.
+uint64_t dev_node_id(const char* dev_name);
+
 // The kernel's sector count; written to sectors only on success.
 void dev_get_sectors(const char* disk_name, const char* dev_name, uint64_t* sectors);
 

@@ -52,6 +52,11 @@ bool path_exists(const char* path)
     return path != nullptr && access(path, F_OK) == 0;
 }
 
+bool path_is_gone(const char* path)
+{
+    return path != nullptr && access(path, F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
+}
+
 int dir_has_entry(const char* path, const char* name)
 {
     if (path == nullptr || name == nullptr) {

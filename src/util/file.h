@@ -34,6 +34,10 @@ constexpr int DIR_WALKS = 3;
 // True when something exists at path.
 [[nodiscard]] bool path_exists(const char* path);
 
+// True when nothing is there. What cannot be looked at for a moment, for want of memory say, is not
+// gone.
+[[nodiscard]] bool path_is_gone(const char* path);
+
 // MATCHES when the directory holds an entry of exactly that name.
 int dir_has_entry(const char* path, const char* name);
 

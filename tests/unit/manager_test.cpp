@@ -455,6 +455,101 @@ TEST_F(Manager, a_mounted_device_that_vanished_deletes_the_database_and_asks_for
     EXPECT_EQ(restart_requested, 1);
 }
 
+TEST_F(Manager, a_disk_pulled_between_the_rescan_and_the_check_is_only_pulled)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    dispatch(EVENT_DISK_ADD, "sda");
+    manager_idle(manager);
+    ASSERT_EQ(times_called("mount -t ext4 -o rw,defaults /dev/sda1 /tmp/mountd/disk1_part1"), 1);
+    write_file(DISK_DB_FILE, "database");
+    // The first thing that the check asks for is the mount table; by then the disk is gone.
+    stubs.add("mount", "rm -rf /sys/block/sda /dev/sda /dev/sda1; cat /run/mounts 2>/dev/null");
+    manager->t_rescan = NOW - 8;
+    const std::string log = capture_stdout([&] { manager_idle(manager); });
+    EXPECT_TRUE(contains(log, "]dev not find, dev = /dev/sda1\n")) << log;
+    EXPECT_TRUE(contains(log, "]disk was pulled, dev = sda\n")) << log;
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
+    EXPECT_EQ(manager->changed, 1);
+    EXPECT_TRUE(std::filesystem::exists(DISK_DB_FILE));
+    EXPECT_EQ(running, 1);
+    EXPECT_EQ(restart_requested, 0);
+}
+
+TEST_F(Manager, a_pulled_disk_that_stays_busy_deletes_the_database_and_asks_for_a_restart)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    dispatch(EVENT_DISK_ADD, "sda");
+    manager_idle(manager);
+    write_file(DISK_DB_FILE, "database");
+    write_file(support::UMOUNT_BUSY, std::string(100, 'x'));
+    unplug("sda1");
+    unplug("sda");
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_FALSE(std::filesystem::exists(DISK_DB_FILE));
+    EXPECT_EQ(restart_requested, 1);
+}
+
+TEST_F(Manager, a_node_gone_while_the_kernel_lists_the_disk_asks_for_a_restart)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    dispatch(EVENT_DISK_ADD, "sda");
+    manager_idle(manager);
+    write_file(DISK_DB_FILE, "database");
+    support::remove_all("/dev/sda1");
+    manager->t_rescan = NOW - 8;
+    const std::string log = capture_stdout([&] { manager_idle(manager); });
+    EXPECT_EQ(restart_requested, 1);
+    EXPECT_EQ(support::count_of(log, "]dev not find, dev = /dev/sda1\n"), 1);
+    EXPECT_FALSE(contains(log, "umount"));
+}
+
+TEST_F(Manager, an_add_for_another_disk_under_a_known_name_takes_it_in)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    dispatch(EVENT_DISK_ADD, "sda");
+    manager_idle(manager);
+    unplug("sda1");
+    unplug("sda");
+    write_file("/dev/keeps_a_number", "");
+    plug_with_part("sda", 300000);
+    const std::string log = capture_stdout([&] { dispatch(EVENT_DISK_ADD, "sda1"); });
+    EXPECT_TRUE(contains(log, "]disk was replaced, dev = sda\n"));
+    EXPECT_EQ(manager->disks.entries[0].disk.parts[0].part.total_len, 300000U);
+    // The messages of the pull come only now.
+    dispatch(EVENT_DISK_REMOVE_DEV, "sda1");
+    EXPECT_EQ(manager->disks.entries[0].disk.parts[0].in_use, 1);
+}
+
+TEST_F(Manager, a_disk_that_a_rescan_took_in_is_mounted_before_anything_is_published)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    // Junk in a pipe ends the wait, and the next idle cycle begins in the same second.
+    manager_idle(manager);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 1);
+    EXPECT_EQ(times_called("mount -t ext4 -o rw,defaults /dev/sda1 /tmp/mountd/disk1_part1"), 1);
+}
+
+TEST_F(Manager, a_safe_removal_forgets_pulled_disks_too)
+{
+    make_calm();
+    plug_with_part("sda", 400000);
+    dispatch(EVENT_DISK_ADD, "sda");
+    manager_idle(manager);
+    unplug("sda1");
+    unplug("sda");
+    dispatch(EVENT_DISK_SAFE_REMOVE, "");
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
+    EXPECT_EQ(read_file(support::MOUNTS_FILE), "");
+}
+
 TEST_F(Manager, two_devices_on_one_path_delete_the_database_and_ask_for_a_restart)
 {
     make_calm();

@@ -39,6 +39,8 @@ protected:
     {
         const std::string disk = "sd" + std::string(1, static_cast<char>('a' + place));
         put_root(&sets.entries[place], disk.c_str(), 50000);
+        // A pass takes disks that the kernel does not list for pulled ones.
+        support::make_dir("/sys/block/" + disk);
         sets.entries[place].disk.root.mount_point_num = disk_number;
         part_info* part = put_part(&sets.entries[place].disk, 0, (disk + "1").c_str(), 4000);
         part->mount_point_num = 1;
@@ -118,6 +120,7 @@ TEST_F(Mount, the_whole_disk_takes_part_1_whatever_its_number)
 TEST_F(Mount, a_whole_disk_filesystem_is_mounted_as_part_1_and_its_partitions_from_part_2)
 {
     put_root(&sets.entries[0], "sda", 9000);
+    support::make_dir("/sys/block/sda");
     sets.entries[0].disk.root.fs_type = FS_EXT4;
     put_part(&sets.entries[0].disk, 0, "sda1", 4000)->fs_type = FS_NTFS;
     mount_all(&sets);
@@ -342,6 +345,59 @@ TEST_F(Mount, a_pass_drops_small_partitions_and_refreshes_the_free_space_afterwa
     EXPECT_EQ(sets.entries[0].disk.parts[1].in_use, 0);
     EXPECT_EQ(actions().size(), 1U);
     EXPECT_GT(sets.entries[0].disk.parts[0].part.free_size, 0U);
+}
+
+TEST_F(Mount,
+       a_disk_that_returned_under_another_name_gets_its_directory_although_the_old_is_mounted)
+{
+    plug_with_part("sda", "U-A", 9000);
+    plug_with_part("sdb", "U-B", 5000);
+    disk_sets_add_dev(&sets, "sda");
+    disk_sets_add_dev(&sets, "sdb");
+    mount_all(&sets);
+    unplug("sdb");
+    plug_with_part("sdc", "U-B", 5000);
+    disk_sets_add_dev(&sets, "sdc");
+    const std::string log = capture_stdout([&] { mount_all(&sets); });
+    EXPECT_TRUE(contains(log, "]disk was pulled, dev = sdb\n")) << log;
+    EXPECT_FALSE(contains(log, "=== ===> update uid"));
+    EXPECT_EQ(remembered("U-B"), "sdb1 disk2_part1 /tmp/mountd/disk2_part1 yes");
+    EXPECT_EQ(support::read_file(support::MOUNTS_FILE),
+              "/dev/sda1 on /tmp/mountd/disk1_part1 type x (rw)\n"
+              "/dev/sdc1 on /tmp/mountd/disk2_part1 type x (rw)\n");
+}
+
+TEST_F(Mount, a_disk_pulled_while_another_is_waited_for_is_neither_mounted_nor_kept)
+{
+    plug_with_part("sda", "U-A", 9000);
+    plug_with_part("sdb", "U-B", 5000);
+    disk_sets_add_dev(&sets, "sda");
+    disk_sets_add_dev(&sets, "sdb");
+    support::the_clock.on_sleep = [&] { unplug("sdb"); };
+    mount_all(&sets);
+    EXPECT_EQ(disk_sets_count(&sets), 1);
+    EXPECT_EQ(remembered("U-B"), "nothing");
+    EXPECT_EQ(times_called("mount -t ext4 -o rw,defaults /dev/sdb1 /tmp/mountd/disk2_part1"), 0);
+}
+
+TEST_F(Mount, a_pass_with_nothing_to_mount_does_not_ask_who_left)
+{
+    plug_with_part("sda", "U-A", 9000);
+    disk_sets_add_dev(&sets, "sda");
+    mount_all(&sets);
+    unplug("sda");
+    mount_all(&sets);
+    EXPECT_EQ(disk_sets_count(&sets), 1);
+}
+
+TEST_F(Mount, a_mount_that_the_inventory_does_not_know_pushes_a_disk_out_of_its_directory)
+{
+    remember("U-A", "sda1", "disk4_part1");
+    plug_with_part("sda", "U-A", 9000);
+    disk_sets_add_dev(&sets, "sda");
+    add_mount("/dev/sdq1", "/tmp/mountd/disk4_part1");
+    mount_all(&sets);
+    EXPECT_EQ(remembered("U-A"), "sda1 disk1_part1 /tmp/mountd/disk1_part1 yes");
 }
 
 TEST_F(Mount, every_pass_gives_slots_their_part_numbers_again)

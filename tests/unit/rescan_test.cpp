@@ -6,12 +6,16 @@
 #include <cstdio>
 #include <string>
 
+#include "disk/discovery.h"
 #include "disk/disk_sets.h"
+#include "disk/removal.h"
 #include "support/capture.h"
 #include "support/child.h"
 #include "support/disk_world.h"
+#include "support/files.h"
 #include "support/records.h"
 #include "support/text.h"
+#include "util/block_dev.h"
 
 using support::capture_stdout;
 using support::contains;
@@ -22,6 +26,24 @@ namespace {
 class Rescan : public support::disk_world {
 protected:
     void plug(const std::string& name) { plug_disk(name, R"(PTTYPE="dos")", 5000); }
+
+    // Another one under the same name.
+    void replace(const std::string& name)
+    {
+        unplug(name);
+        support::write_file("/dev/keeps_a_number", "");
+        plug(name);
+        support::remove_all("/dev/keeps_a_number");
+    }
+
+    static std::vector<std::string> listed()
+    {
+        std::vector<std::string> names;
+        for (const auto& entry : std::filesystem::directory_iterator("/sys/block")) {
+            names.push_back(entry.path().filename());
+        }
+        return names;
+    }
 
     static std::string letter_name(int i)
     {
@@ -71,6 +93,74 @@ TEST_F(Rescan, the_first_rescan_offers_known_disks_again_and_the_inventory_ignor
         EXPECT_EQ(disk_sets_count(&sets), 1);
     });
     EXPECT_TRUE(contains(log, "=== ===> dev is already add! dev name = sda\n"));
+}
+
+TEST_F(Rescan, a_disk_that_came_and_went_between_two_rescans_is_forgotten)
+{
+    plug("sda");
+    disk_sets_add_dev(&sets, "sda");
+    unplug("sda");
+    const std::string log = capture_stdout([&] { EXPECT_EQ(rescan(), 1); });
+    EXPECT_FALSE(holds("sda"));
+    EXPECT_TRUE(contains(log, "]disk was pulled, dev = sda\n")) << log;
+    EXPECT_EQ(rescan(), 0);
+}
+
+TEST_F(Rescan, another_disk_under_a_known_name_is_gone_and_new)
+{
+    plug("sda");
+    EXPECT_EQ(rescan(), 1);
+    const uint64_t before = sets.entries[0].disk.node_id;
+    replace("sda");
+    const std::string log = capture_stdout([&] { EXPECT_EQ(rescan(), 1); });
+    EXPECT_TRUE(contains(log, "]disk was replaced, dev = sda\n")) << log;
+    EXPECT_TRUE(holds("sda"));
+    EXPECT_NE(sets.entries[0].disk.node_id, before);
+    EXPECT_EQ(rescan(), 0);
+}
+
+TEST_F(Rescan, a_disk_replaced_before_any_rescan_listed_it_is_gone_and_new)
+{
+    plug("sda");
+    disk_sets_add_dev(&sets, "sda");
+    replace("sda");
+    EXPECT_EQ(rescan(), 1);
+    EXPECT_TRUE(holds("sda"));
+    EXPECT_EQ(sets.entries[0].disk.node_id, dev_node_id("sda"));
+}
+
+TEST_F(Rescan, a_removed_disk_that_stays_plugged_stays_removed_and_returns_when_it_is_replaced)
+{
+    plug("sda");
+    rescan();
+    remove_dev(&sets, "sda");
+    EXPECT_EQ(rescan(), 0);
+    EXPECT_FALSE(holds("sda"));
+    // A node that is missing for a moment makes no new disk.
+    support::remove_all("/dev/sda");
+    EXPECT_EQ(rescan(), 0);
+    EXPECT_FALSE(holds("sda"));
+    replace("sda");
+    EXPECT_EQ(rescan(), 1);
+    EXPECT_TRUE(holds("sda"));
+}
+
+TEST_F(Rescan, disks_beyond_the_sixteen_of_the_list_were_not_pulled)
+{
+    for (int i = 0; i < 17; ++i) {
+        plug(letter_name(i));
+    }
+    for (const auto& name : listed()) {
+        disk_sets_add_dev(&sets, name.c_str());
+        if (disk_sets_count(&sets) == 16) {
+            break;
+        }
+    }
+    // The kernel lists them in whatever order: one of the 16 has no slot in some of these cases.
+    for (int i = 0; i < 3; ++i) {
+        rescan();
+        EXPECT_EQ(disk_sets_count(&sets), 16);
+    }
 }
 
 TEST_F(Rescan, other_block_devices_are_not_offered)

@@ -2,6 +2,7 @@
 
 #include <iterator>
 
+#include "disk/pulled.h"
 #include "log/log.h"
 #include "main/options.h"
 #include "main/signals.h"
@@ -19,6 +20,7 @@ void forget()
     log_reset();
     signals_reset();
     manager_life_reset();
+    pulled_reset();
     rescan_reset();
     firewall_rule_reset();
     block_input_mode = 0;
