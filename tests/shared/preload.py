@@ -17,10 +17,11 @@ def build(folder):
     return Path(folder)
 
 
-def install(world, folder, *names, haste=HASTE):
+def install(world, folder, *names, haste=HASTE, haste_waits=None):
     """Put libraries where the world sees them; returns the daemon's environment."""
     places = []
     for name in names:
         places.append(f"/run/world/{name}.so")
         world.path(places[-1]).write_bytes((folder / f"{name}.so").read_bytes())
-    return {"LD_PRELOAD": ":".join(places), "HASTE": str(haste), "ALLOC_CONTROL": CONTROL}
+    return {"LD_PRELOAD": ":".join(places), "HASTE": str(haste),
+            "HASTE_WAITS": str(haste_waits or haste), "ALLOC_CONTROL": CONTROL}
