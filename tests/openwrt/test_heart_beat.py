@@ -53,10 +53,16 @@ def test_it_stands_aside_while_the_companion_runs(quick_router):
     wait_beats(quick_router, 1)
 
 
+def wait_pause(router):
+    """Wait for the pause between two messages: nothing holds the script up."""
+    wait_for(lambda: router.world.run("pgrep", "-f", "^sleep 1$", check=False).stdout, 10, "its pause")
+
+
 def beat_alone(router):
     """Run the script without a service for some beats; returns what it printed."""
     script = router.world.popen("/bin/sh", "-c", f"exec {HEART_BEAT} >/tmp/beat.out 2>&1")
-    time.sleep(3.5)
+    time.sleep(3)
+    wait_pause(router)
     assert script.poll() is None
     script.terminate()
     router.world.sh(f"kill $(pgrep -f {HEART_BEAT})", check=False)
@@ -66,6 +72,7 @@ def beat_alone(router):
 
 def test_without_a_daemon_nothing_is_made_and_nothing_said(quick_router):
     syslog = quick_router.world.syslog()
+    quick_router.world.sh("mkdir -p /tmp/tarn_nas")
     assert beat_alone(quick_router) == ""
     assert not quick_router.world.exists(PIPES["add_remove"])
     assert syslog.messages() == []
@@ -99,7 +106,9 @@ def test_a_full_pipe_does_not_hold_it_up_and_is_not_told(quick_router):
         while True:
             os.write(fd, b"\n")
     os.close(fd)
-    time.sleep(5)
+    # Its pause between two messages goes on coming.
+    time.sleep(3)
+    wait_pause(quick_router)
     quick_router.mode("")
     wait_for(lambda: len(quick_router.messages()) > 1000, 30, "the pipe's contents")
     wait_beats(quick_router, 2)
