@@ -33,6 +33,9 @@ TOLD = [
     FAILED.format("sda1"),
     UMOUNT.format("sda1"),
     OWN.format("mmcblk0"),
+    "Warning[pulled.cpp:100]disk was pulled, dev = sda",
+    "Warning[pulled.cpp:186]disk was replaced, dev = sda",
+    "Warning[pulled.cpp:228]removal of a former disk, dev = sda1",
     "manager.cpp(114)===> safe remove disk",
     "mount_point.cpp(202)mount path err:",
     "mount_point.cpp(81)/dev/sda1 ===> /tmp/mountd/disk1_part1",
@@ -100,7 +103,8 @@ def test_a_line_keeps_its_blanks_and_backslashes(logged):
 @pytest.mark.parametrize("text", [
     "mount OK, %s ==> %s", "=== === === mount ERROR, %s ==> %s", "==> umount dev = %s", "clear dev = %s",
     "=== ===> mount root part, dev name = %s", "=== ===> mount sub part, i = %d, name = %s",
-    "err fs type = %s", "router's own disk, dev = %s", "===> safe remove disk", "mount path err:", "%s ===> %s",
+    "err fs type = %s", "disk was pulled, dev = %s", "disk was replaced, dev = %s",
+    "removal of a former disk, dev = %s", "router's own disk, dev = %s", "===> safe remove disk", "mount path err:", "%s ===> %s",
     "dev not find, dev = %s", "===> pid exist, file = %s", "sys timeout, %d > %d", "no event ...",
     "get event = %s", "manager work again!", "scan path = %s"])
 def test_the_daemon_says_what_is_looked_for(text):
