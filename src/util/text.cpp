@@ -23,10 +23,12 @@ void text_copy_n(std::span<char> out, const char* text, size_t count)
 
 void text_format(std::span<char> out, const char* fmt, ...)
 {
-    text_clear(out);
+    char* text = out.data();
+    const size_t size = out.size();
+    memset(text, 0, size);
     va_list args;
     va_start(args, fmt);
-    vsnprintf(out.data(), out.size(), fmt, args);
+    vsnprintf(text, size, fmt, args);
     va_end(args);
 }
 
