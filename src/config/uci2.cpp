@@ -71,20 +71,20 @@ bool change(uci_context* ctx, uci_ptr* ptr, const char* path, const path_copy& c
 
 int change_unsaved(uci_context* ctx, const char* path, const char* value, config_call call)
 {
-    uci_ptr ptr;
+    uci_ptr ptr{};
     return change(ctx, &ptr, path, path_copy(path, value), call) ? 0 : -1;
 }
 
 int change_and_save(uci_context* ctx, const char* path, const path_copy& copy, config_call call)
 {
-    uci_ptr ptr;
+    uci_ptr ptr{};
     return change(ctx, &ptr, path, copy, call) && uci_save(ctx, ptr.p) == UCI_OK ? 0 : -1;
 }
 
 uci_package* look_up_package(uci_context* ctx, const char* name)
 {
     const path_copy path(name);
-    uci_ptr ptr;
+    uci_ptr ptr{};
     return config_look_up(ctx, path, &ptr) ? ptr.p : nullptr;
 }
 
@@ -92,7 +92,7 @@ uci_package* look_up_package(uci_context* ctx, const char* name)
 uci_list* look_up_list(uci_context* ctx, const char* path)
 {
     const path_copy copy(path);
-    uci_ptr ptr;
+    uci_ptr ptr{};
     if (!config_look_up_complete(ctx, copy, &ptr) || ptr.o == nullptr) {
         return nullptr;
     }
@@ -145,7 +145,7 @@ int uci2_get(uci_context* ctx, const char* path, char* out, size_t size)
     }
     text_copy({out, size}, "");
     const path_copy copy(path);
-    uci_ptr ptr;
+    uci_ptr ptr{};
     if (!config_look_up_complete(ctx, copy, &ptr)) {
         return -1;
     }
@@ -211,7 +211,7 @@ int uci2_del_list(uci_context* ctx, const char* path, const char* value)
 int uci2_commit(uci_context* ctx, const char* package)
 {
     const path_copy path(package);
-    uci_ptr ptr;
+    uci_ptr ptr{};
     const bool done = config_look_up(ctx, path, &ptr) && uci_commit(ctx, &ptr.p, false) == UCI_OK;
     // Routers lose power without notice.
     sync();
@@ -266,7 +266,7 @@ uci_section* uci2_get_section(uci_context* ctx, const char* type, int index)
         return nullptr;
     }
     const path_copy copy(path);
-    uci_ptr ptr;
+    uci_ptr ptr{};
     return config_look_up_complete(ctx, copy, &ptr) ? ptr.s : nullptr;
 }
 

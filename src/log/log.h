@@ -35,6 +35,7 @@ int log_file_open();
 // Closes the log file when one is open, for the last time: no log file call may follow. Always 0.
 int log_file_close();
 
+// Kept for a maker's own code; nobody in the daemon calls it, and its log file stays empty.
 // Appends text to the log file, opening it when needed. 0 when written; 1 when the file cannot be
 // opened or 1501 writes were made already, so that a chatty caller cannot fill a RAM disk.
 int log_file_write(const char* text);

@@ -25,6 +25,7 @@ constexpr int DIR_MAKE_TRIES = 8;
 
 int write_all(FILE* stream, const void* bytes, int32_t length)
 {
+    // What a full disk refuses shows when the stream is closed, and is no failure there either.
     const int ret = stream_write_all(stream, bytes, length);
     if (ret != 0) {
         log_info("file write err, len = %d, ret = %d\n", length, ret);

@@ -27,8 +27,8 @@ struct dir_stream {
     const char* next_name();
 };
 
-// How often a directory is walked when reading breaks off, for want of memory say. An entry that was
-// only not reached must not count as one that is not there.
+// How often a directory is walked when reading breaks off, for want of memory say. An entry that
+// was only not reached must not count as one that is not there.
 constexpr int DIR_WALKS = 3;
 
 // True when something exists at path.
@@ -41,30 +41,12 @@ constexpr int DIR_WALKS = 3;
 // MATCHES when the directory holds an entry of exactly that name.
 int dir_has_entry(const char* path, const char* name);
 
-// Size in bytes, 0 on failure; exists (may be null) becomes 1 on success and 0 on failure.
-int64_t file_get_size(const char* path, uint8_t* exists);
-
-// Writes length bytes. A stream that takes no more bytes ends the loop as a success.
-int stream_write_all(FILE* stream, const void* bytes, int32_t length);
-
-// Creates or truncates the file and writes length bytes.
+// Creates or truncates the file and writes length bytes. That a full disk took none of them is not
+// told: what must be whole is published (util/publish.h).
 int file_write(const char* path, const void* bytes, int32_t length);
-
-// Appends length bytes, creating the file when it is missing.
-int file_append(const char* path, const void* bytes, int32_t length);
-
-// 0 when exactly length bytes were read, 1 when the data ended early.
-int fd_read_full(int fd, void* buffer, int32_t length);
-
-// Reads length bytes at offset. A missing file is created empty (mode 0600) and fails the read.
-int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length);
 
 // The whole content with a terminating zero, to be released with free(); null on failure.
 char* file_read_all(const char* path);
-
-// Zero-fills buffer and reads up to size bytes. A file of at least size bytes leaves no terminating
-// zero.
-int file_read_buf(const char* path, void* buffer, int32_t size);
 
 // The first characters of a file, cut to out and zero-filled; an empty text on failure.
 int file_read_text(const char* path, std::span<char> out);
@@ -81,3 +63,26 @@ int dir_make_own(const char* path);
 // Makes the FIFO (mode 0600) when path is missing and opens it for reading and writing without
 // blocking, so that it never reports end-of-file. The caller owns the descriptor; -1 on failure.
 int fifo_create_open(const char* path);
+
+// What the operations above are made of.
+
+// Size in bytes, 0 on failure; exists (may be null) becomes 1 on success and 0 on failure.
+int64_t file_get_size(const char* path, uint8_t* exists);
+
+// Writes length bytes. A stream that takes no more bytes ends the loop as a success.
+int stream_write_all(FILE* stream, const void* bytes, int32_t length);
+
+// 0 when exactly length bytes were read, 1 when the data ended early.
+int fd_read_full(int fd, void* buffer, int32_t length);
+
+// Kept for a maker's own code; nobody in the daemon calls them.
+
+// Appends length bytes, creating the file when it is missing.
+int file_append(const char* path, const void* bytes, int32_t length);
+
+// Reads length bytes at offset. A missing file is created empty (mode 0600) and fails the read.
+int file_read_at(const char* path, int32_t offset, void* buffer, int32_t length);
+
+// Zero-fills buffer and reads up to size bytes. A file of at least size bytes leaves no terminating
+// zero.
+int file_read_buf(const char* path, void* buffer, int32_t size);

@@ -45,10 +45,3 @@ using fd_guard = guard<int, -1, close>;
 using stream_guard = guard<FILE*, nullptr, fclose>;
 using dir_guard = guard<DIR*, nullptr, closedir>;
 using text_guard = guard<char*, nullptr, free>;  // text from malloc
-
-// Closes a stream that was written to. False when not all of it reached the file, which on a full
-// disk often shows only here.
-[[nodiscard]] inline bool stream_close(stream_guard& stream)
-{
-    return fclose(stream.release()) == 0;
-}

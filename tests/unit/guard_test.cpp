@@ -86,18 +86,4 @@ TEST(Guard, descriptor_zero_is_something)
     }
 }
 
-TEST(Guard, closing_a_stream_tells_that_the_disk_is_full)
-{
-    stream_guard full(fopen("/dev/full", "we"));
-    ASSERT_NE(full, nullptr);
-    EXPECT_GE(fputs("text", full), 0);
-    EXPECT_FALSE(stream_close(full));
-    EXPECT_EQ(full, nullptr);
-
-    stream_guard null(fopen("/dev/null", "we"));
-    ASSERT_NE(null, nullptr);
-    EXPECT_GE(fputs("text", null), 0);
-    EXPECT_TRUE(stream_close(null));
-}
-
 }  // namespace
