@@ -18,6 +18,8 @@ from world.state import DISK_JSON, MOUNT_BASE, PID_FILE
 PACKAGE = CHECKOUT / "openwrt" / "tarn-nas-diskmanager" / "files"
 LIBRARIES = "lib/x86_64-linux-gnu"
 HOTPLUG = "etc/hotplug.d/block/60-tarn_nas_diskmanager"
+# The machine's /usr/lib is its /lib.
+HELPERS = "lib/tarn-nas-diskmanager"
 
 PIPE = PIPES["add_remove"]
 
@@ -39,6 +41,8 @@ def pack_daemon(archive):
         (root / HOTPLUG).parent.mkdir(parents=True)
         shutil.copy2(RELEASE, root / "bin" / RELEASE.name)
         shutil.copy2(PACKAGE / "tarn_nas_diskmanager.hotplug", root / HOTPLUG)
+        (root / HELPERS).mkdir()
+        shutil.copy2(PACKAGE / "pipe.sh", root / HELPERS / "pipe.sh")
         shutil.copy2(PACKAGE / "disk_get_label.sh", root / "bin" / "disk_get_label.sh")
         (root / "bin" / "disk_get_label.sh").chmod(0o755)
 
