@@ -20,6 +20,7 @@ PLUGIN_PACKAGE = "rpcd-mod-tarn-nas-diskmanager"
 PAGE_PACKAGE = "luci-app-tarn-nas-diskmanager"
 OBJECT = "tarn_nas_diskmanager"
 PLUGIN = f"/usr/libexec/rpcd/{OBJECT}"
+SCRIPTS = "/usr/lib/tarn-nas-diskmanager"
 JSHN = CHECKOUT / "build/deps/jshn/bin/jshn"
 
 
@@ -38,8 +39,9 @@ class Plugin:
         if not JSHN.exists():
             raise FileNotFoundError(f"{JSHN} is not built (scripts/setup makes it)")
         world.path(f"{STUB_DIR}/jshn").symlink_to(JSHN)
-        for directory in ("/usr/libexec", "/usr/share"):
+        for directory in ("/usr/libexec", "/usr/lib"):
             overlay(world, directory)
+        world.write(f"{SCRIPTS}/pipe.sh", (OPENWRT / "tarn-nas-diskmanager/files/pipe.sh").read_text())
         for source in (path for path in root.rglob("*") if path.is_file()):
             target = world.path("/" + str(source.relative_to(root)))
             target.parent.mkdir(parents=True, exist_ok=True)

@@ -42,7 +42,7 @@ def make(top, package, *targets):
 
 
 def test_the_plugin_lies_where_rpcd_looks_for_it(plugin_root, figure):
-    assert files(plugin_root) == [f"usr/libexec/rpcd/{OBJECT}", f"usr/share/{OBJECT}/inventory.sh"]
+    assert files(plugin_root) == ["usr/lib/tarn-nas-diskmanager/inventory.sh", f"usr/libexec/rpcd/{OBJECT}"]
     assert os.access(plugin_root / f"usr/libexec/rpcd/{OBJECT}", os.X_OK)
     figure("contents of the plugin's package", f"{size(plugin_root)} bytes")
 
