@@ -10,6 +10,9 @@ import sys
 
 from demo.shell import Shell
 from demo.show import Failed, Narrator, mount_listing, table
+from web.router import PLUGIN_PACKAGE, Plugin, stage
+from web.server import PageServer
+
 from world import Partition, World, kernel_has, missing
 from world.state import PID_FILE
 
@@ -17,6 +20,7 @@ from world.state import PID_FILE
 MOUNT_TIMEOUT = 45
 REMOVE_TIMEOUT = 45
 LOG_TAIL = 3000
+PAGE_PORT = 8017
 
 
 def make_disks(world):
@@ -208,8 +212,8 @@ class Story:
 
 
 def main(arguments):
-    if arguments not in ([], ["--shell"]):
-        print("usage: scripts/demo [--shell]", file=sys.stderr)
+    if arguments not in ([], ["--shell"], ["--web"]):
+        print("usage: scripts/demo [--shell | --web]", file=sys.stderr)
         return 2
     lacks = missing() + [f"the kernel cannot mount {fs}" for fs in ("ext4", "ntfs")
                          if not kernel_has(fs)]
@@ -226,9 +230,24 @@ def main(arguments):
             print(f"The daemon does not start: {error}", file=sys.stderr)
             return 1
         tell = Narrator(lambda: daemon.running)
+        if arguments == ["--web"]:
+            show_page(world, tell)
         if arguments:
             return Shell(world, daemon, tell, make_disks(world)).run(sys.stdin)
         return tell_story(world, daemon, tell)
+
+
+def show_page(world, tell):
+    """Serve the web interface's page for as long as this process lives."""
+    server = PageServer(Plugin(world, stage(PLUGIN_PACKAGE, world.workdir / "plugin")), PAGE_PORT)
+    tell.say(f"""
+The page is at {server.url} for a browser on this machine. Plug and pull disks
+here, look and remove them there. A small stand-in takes the place of LuCI's menu and
+theme; plugin, page and access rights are the real ones.
+  {server.url}?user=reader    an account that may only look
+  {server.url}?lang=de        in German
+From another machine: ssh -L {server.port}:127.0.0.1:{server.port} this-machine
+""")
 
 
 def tell_story(world, daemon, tell):

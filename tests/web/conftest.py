@@ -2,7 +2,8 @@
 
 import pytest
 from web.browser import Browser
-from web.router import PLUGIN_PACKAGE, Listener, Plugin, stage
+from web.exchange import CheckedPlugin
+from web.router import PLUGIN_PACKAGE, Listener, stage
 from web.server import PageServer
 from web.test_list import add_disk, mount, part, publish
 
@@ -24,7 +25,7 @@ def world(make_world):
 @pytest.fixture
 def plugin(world, plugin_root):
     """The plugin in `world`."""
-    return Plugin(world, plugin_root)
+    return CheckedPlugin(world, plugin_root)
 
 
 @pytest.fixture

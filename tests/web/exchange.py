@@ -3,6 +3,7 @@
 import json
 
 import jsonschema
+from web.router import Plugin
 
 from world import CHECKOUT
 
@@ -29,3 +30,12 @@ def is_call(method, arguments):
 def words(field):
     """The words that an answer to "list" may have as reason of a "part" or of an "unused" device."""
     return SCHEMAS["list"]["definitions"][field]["properties"]["reason"]["enum"]
+
+
+class CheckedPlugin(Plugin):
+    """The plugin, each answer of which is as its schema says."""
+
+    def call(self, method, arguments=None, timeout=20):
+        answer = super().call(method, arguments, timeout)
+        assert objections(method, answer) == [], answer
+        return answer

@@ -6,8 +6,6 @@ import os
 import shutil
 import subprocess
 
-from web.exchange import objections
-
 from world import CHECKOUT, wait_for
 from world.events import PIPES
 from world.overlay import overlay
@@ -52,10 +50,8 @@ class Plugin:
         return json.loads(self.world.run(PLUGIN, "list").stdout)
 
     def call(self, method, arguments=None, timeout=20):
-        """The answer to a call, which is as its schema says."""
-        answer = json.loads(self.call_text(method, json.dumps(arguments or {}), timeout))
-        assert objections(method, answer) == [], answer
-        return answer
+        """The answer to a call."""
+        return json.loads(self.call_text(method, json.dumps(arguments or {}), timeout))
 
     def error(self, method, arguments=None):
         """The word for why a call did nothing; empty when it did."""

@@ -60,9 +60,10 @@ class PageServer:
         self.sessions = {name: secrets.token_hex(16) for name in RIGHTS}
         self.calls = []
         self.broken = False
-        self._server = ThreadingHTTPServer(("127.0.0.1", port), _handler(self))
+        self._server = _listen(port, _handler(self))
         self._server.daemon_threads = True
-        self.url = f"http://127.0.0.1:{self._server.server_port}/"
+        self.port = self._server.server_port
+        self.url = f"http://127.0.0.1:{self.port}/"
         threading.Thread(target=self._server.serve_forever, daemon=True).start()
 
     def close(self):
@@ -95,6 +96,14 @@ class PageServer:
             return [UBUS_NOT_FOUND]
         text = self.plugin.call_text(method, json.dumps({**arguments, "ubus_rpc_session": "0" * 32}))
         return [0, json.loads(text)] if text else [UBUS_INVALID_COMMAND]
+
+
+def _listen(port, handler):
+    """A server on the port, or on any when that one is taken."""
+    try:
+        return ThreadingHTTPServer(("127.0.0.1", port), handler)
+    except OSError:
+        return ThreadingHTTPServer(("127.0.0.1", 0), handler)
 
 
 def _handler(page):
