@@ -16,6 +16,9 @@
 
 namespace {
 
+// Forgets the disks that have left; null to believe the table.
+using forget_operation = bool (*)(disk_sets* sets);
+
 constexpr int32_t ROOT_PART_NUMBER = 1;
 
 // Proposes the directory that the part's numbers stand for.
@@ -117,9 +120,33 @@ void take_remembered_path(part_info* part, disk_db_record* record)
     disk_db_set_mountd(record);
 }
 
-}  // namespace
+void mount_disk(disk_obj* disk)
+{
+    number_sub_parts(disk);
+    mount_root_part(disk);
+    mount_sub_parts(disk);
+}
 
-int mount_all(disk_sets* sets)
+int mount_each(disk_sets* sets, forget_operation forget)
+{
+    if (sets == nullptr) {
+        return 1;
+    }
+    log_info("*** *** *** mount path\n");
+    for (disk_entry& entry : sets->entries) {
+        // The disk before may have been waited for long enough for others to leave. A directory
+        // that a pulled disk still occupies would look taken to the same disk under another name.
+        if (forget != nullptr && entry.in_use == 1 && has_part_to_mount(&entry.disk)) {
+            forget(sets);
+        }
+        if (entry.in_use == 1) {
+            mount_disk(&entry.disk);
+        }
+    }
+    return 0;
+}
+
+int run_pass(disk_sets* sets, forget_operation forget)
 {
     if (sets == nullptr) {
         log_err("err!\n");
@@ -131,30 +158,26 @@ int mount_all(disk_sets* sets)
         disk_sets_sort_by_size(sets);
         set_all_mount_point_num(sets);
     }
-    mount_disk_sets(sets);
+    mount_each(sets, forget);
     disk_sets_refresh_sizes(sets);
     return 0;
 }
 
+}  // namespace
+
+int mount_all(disk_sets* sets)
+{
+    return run_pass(sets, nullptr);
+}
+
+int mount_all_present(disk_sets* sets)
+{
+    return run_pass(sets, forget_pulled_disks);
+}
+
 int mount_disk_sets(disk_sets* sets)
 {
-    if (sets == nullptr) {
-        return 1;
-    }
-    log_info("*** *** *** mount path\n");
-    for (disk_entry& entry : sets->entries) {
-        // The disk before may have been waited for long enough for others to leave. A directory
-        // that a pulled disk still occupies would look taken to the same disk under another name.
-        if (entry.in_use == 1 && has_part_to_mount(&entry.disk)) {
-            forget_pulled_disks(sets);
-        }
-        if (entry.in_use == 1) {
-            number_sub_parts(&entry.disk);
-            mount_root_part(&entry.disk);
-            mount_sub_parts(&entry.disk);
-        }
-    }
-    return 0;
+    return mount_each(sets, nullptr);
 }
 
 int mount_root_part(disk_obj* disk)

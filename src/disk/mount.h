@@ -11,6 +11,10 @@ constexpr int MOUNT_WAIT_SECONDS = 2;  // each after a pause of this length
 // not appear. 0, 1 for a null table.
 int mount_all(disk_sets* sets);
 
+// mount_all as the loop runs it: before each disk that has something to mount, those that the
+// kernel no longer lists are forgotten. mount_all believes its table.
+int mount_all_present(disk_sets* sets);
+
 // Parts of the pass. Always 0, 1 for a null argument.
 int mount_disk_sets(disk_sets* sets);
 int mount_root_part(disk_obj* disk);

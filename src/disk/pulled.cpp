@@ -215,20 +215,18 @@ int remove_pulled_disk(disk_sets* sets, const char* root_dev)
     return 0;
 }
 
-int remove_told_dev(disk_sets* sets, const char* dev_name)
+bool may_mean_former_disk(const disk_sets* sets, const char* dev_name)
 {
     const int place = sets != nullptr ? find_owner(sets, dev_name) : -1;
     if (place < 0) {
-        return remove_dev(sets, dev_name);
+        return false;
     }
     const char* root_dev = sets->entries[place].disk.root.dev_name;
     if (has_left(sets, place)) {
         note_departure(root_dev);
-    } else if (has_left_lately(root_dev) && !node_is_gone(dev_name)) {
-        log_warn("removal of a former disk, dev = %s\n", dev_name);
-        return 0;
+        return false;
     }
-    return remove_dev(sets, dev_name);
+    return has_left_lately(root_dev) && !node_is_gone(dev_name);
 }
 
 void pulled_reset()

@@ -7,8 +7,8 @@
 
 #include "disk/disk_sets.h"
 
-// A pulled disk's messages may be late. For so long they are not taken for those of a disk that has
-// its name by now.
+// A pulled disk's messages may be late: for so long they may come for a disk that has its name by
+// now.
 constexpr int64_t FORMER_DISK_SECONDS = 20;
 
 // Unmounts and forgets every disk that the kernel no longer lists, or lists anew. True when there
@@ -25,9 +25,9 @@ bool forget_leaving_disks(disk_sets* sets);
 // remove_root_part of a disk that is known to have left. 0, 1 when there is none.
 int remove_pulled_disk(disk_sets* sets, const char* root_dev);
 
-// remove_dev as a message asks for it, unless the message is about a disk that left before and has
-// come for one that took its name. Always 0, 1 for a null table.
-int remove_told_dev(disk_sets* sets, const char* dev_name);
+// True when a message about the device's removal may mean a disk that left lately, and not the one
+// that has its name now. Notes a disk that leaves with this message.
+[[nodiscard]] bool may_mean_former_disk(const disk_sets* sets, const char* dev_name);
 
 // Forgets which disks have left. For tests.
 void pulled_reset();

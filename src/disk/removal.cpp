@@ -1,12 +1,10 @@
 #include "disk/removal.h"
 
-#include "disk/discovery.h"
 #include "disk/disk_db.h"
 #include "disk/mount_table.h"
 #include "log/log.h"
 #include "util/block_dev.h"
 #include "util/file.h"
-#include "util/fs_code.h"
 #include "util/mount_cmd.h"
 #include "util/paths.h"
 #include "util/pause.h"
@@ -42,36 +40,6 @@ disk_obj* owner_of(disk_sets* sets, const part_info* part)
         }
     }
     return nullptr;
-}
-
-// A disk that nothing was planned for yet looks empty, and waits for its first mount pass.
-bool awaits_mount_pass(const disk_obj* disk)
-{
-    bool has_part = false;
-    for (const part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && slot.part.mount_path[0] != '\0') {
-            return false;
-        }
-        has_part |= slot.in_use == 1;
-    }
-    return has_part && disk->root.fs_type == FS_NONE;
-}
-
-// Drops the empty disks, and those that only look so. The latter come back as new ones: what was
-// removed is another disk.
-void clear_empty_disks(disk_sets* sets)
-{
-    char waiting[MAX_DISKS][PART_DEV_NAME_SIZE];
-    int count = 0;
-    for (const disk_entry& entry : sets->entries) {
-        if (entry.in_use == 1 && awaits_mount_pass(&entry.disk)) {
-            text_copy(waiting[count++], entry.disk.root.dev_name);
-        }
-    }
-    disk_sets_clear_empty(sets);
-    for (int i = 0; i < count; ++i) {
-        disk_sets_add_dev(sets, waiting[i]);
-    }
 }
 
 }  // namespace
@@ -159,7 +127,7 @@ int remove_dev(disk_sets* sets, const char* dev_name)
         log_warn("remove root dev = %s\n", dev_name);
         remove_root_part(sets, dev_name);
     }
-    clear_empty_disks(sets);
+    disk_sets_clear_empty(sets);
     return 0;
 }
 
@@ -177,7 +145,7 @@ int remove_disk(disk_sets* sets, const char* dir_name)
         if (part != nullptr) {
             umount_part(part);
             disk_obj_clear_part(&entry.disk, part);
-            clear_empty_disks(sets);
+            disk_sets_clear_empty(sets);
             return 0;
         }
     }

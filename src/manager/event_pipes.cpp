@@ -234,6 +234,7 @@ int event_wait(event_pipes* pipes, char* buffer, uint32_t size)
     for (const pipe_place& place : PIPES) {
         const int ret = read_pipe(pipes, pipes->*place.fd, std::span(buffer, size));
         if (ret != 0) {
+            pipes->event_fd = pipes->*place.fd;
             return ret;
         }
     }

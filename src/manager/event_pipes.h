@@ -38,6 +38,7 @@ struct event_pipes {
     fd_set except_set;  // the same three
     int32_t max_fd;
     disk_event event;  // the last parsed event
+    int32_t event_fd;  // the pipe that its message came from
 };
 
 // What event_receive answers when there is an event.

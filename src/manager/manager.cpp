@@ -7,11 +7,10 @@
 #include "disk/mount.h"
 #include "disk/mount_point.h"
 #include "disk/pulled.h"
-#include "disk/removal.h"
 #include "log/log.h"
 #include "manager/rescan.h"
 #include "manager/self_check.h"
-#include "manager/services.h"
+#include "manager/told_removal.h"
 #include "util/block_dev.h"
 #include "util/file.h"
 #include "util/paths.h"
@@ -119,14 +118,18 @@ int on_add(disk_manager* manager, const char* dev_name)
     return disk_sets_add_dev(&manager->disks, dev_name);
 }
 
-// The file services must not hold files open while something is unmounted. They are stopped and
-// started for an unknown name too; what went wrong is logged where it happened.
-int on_remove(disk_manager* manager, const char* name, int (*operation)(disk_sets*, const char*))
+int on_remove_dev(disk_manager* manager, const char* dev_name)
+{
+    const event_pipes* pipes = &manager->pipes;
+    manager->changed = 1;
+    remove_told_dev(&manager->disks, dev_name, pipes->event_fd == pipes->fd_add_remove);
+    return 0;
+}
+
+int on_remove_disk(disk_manager* manager, const char* dir_name)
 {
     manager->changed = 1;
-    services_stop();
-    operation(&manager->disks, name);
-    services_start();
+    remove_told_dir(&manager->disks, dir_name);
     return 0;
 }
 
@@ -142,11 +145,7 @@ void lengthen_sys_timeout()
 int on_safe_remove(disk_manager* manager)
 {
     log_info("===> safe remove disk\n");
-    services_stop();
-    safe_remove_all(&manager->disks);
-    // That goes through what the kernel lists; nobody looks for the others while parked.
-    forget_pulled_disks(&manager->disks);
-    services_start();
+    remove_told_all(&manager->disks);
     disk_sets_publish(&manager->disks);
     // docs/limits.md, "After a safe removal only disks that are plugged or announced again come
     // back".
@@ -203,7 +202,7 @@ void do_periodic_work(disk_manager* manager)
         manager->t_update = now;
         manager->update_due = 0;
         const int before = disk_sets_count(&manager->disks);
-        mount_all(&manager->disks);
+        mount_all_present(&manager->disks);
         // The pass forgets disks that were pulled.
         manager->changed |= disk_sets_count(&manager->disks) != before ? 1 : 0;
     }
@@ -226,7 +225,7 @@ void activate(disk_manager* manager, bool mount_known)
     if (mount_known) {
         check_disks_mounted(&manager->disks);
     }
-    mount_all(&manager->disks);
+    mount_all_present(&manager->disks);
     disk_sets_publish(&manager->disks);
 }
 
@@ -341,9 +340,9 @@ int manager_dispatch(disk_manager* manager)
         case EVENT_DISK_ADD:
             return on_add(manager, name);
         case EVENT_DISK_REMOVE_DEV:
-            return on_remove(manager, name, remove_told_dev);
+            return on_remove_dev(manager, name);
         case EVENT_DISK_REMOVE_DISK:
-            return on_remove(manager, name, remove_disk);
+            return on_remove_disk(manager, name);
         case EVENT_DISK_SAFE_REMOVE:
             return on_safe_remove(manager);
         case EVENT_DISK_HEART_BEAT:

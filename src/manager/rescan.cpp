@@ -29,6 +29,18 @@ struct block_slots {
 // that it holds.
 block_slots block_list;
 
+// More than one message about each device of all disks does not come between two rescans; what does
+// not fit stays removed.
+constexpr int OFFERS_MAX = MAX_DISKS * (1 + MAX_SUB_PARTS);
+
+struct offers {
+    char dev_names[OFFERS_MAX][PART_DEV_NAME_SIZE];
+    int count;
+};
+
+// Lasts as long as the process, too.
+offers offered_again;
+
 // Longer names are cut. More names than slots are left for the rescan that finds room:
 // docs/limits.md, "Rescans hold 16 block devices".
 bool read_block_slots(block_slots* list)
@@ -67,6 +79,16 @@ bool is_new(const block_slot& found)
     return known == nullptr || (found.node_id != 0 && found.node_id != known->node_id);
 }
 
+bool offer_again(disk_sets* disks)
+{
+    const bool any = offered_again.count > 0;
+    for (int i = 0; i < offered_again.count; ++i) {
+        disk_sets_add_dev(disks, offered_again.dev_names[i]);
+    }
+    offered_again = {};
+    return any;
+}
+
 }  // namespace
 
 bool rescan_block_devices(disk_sets* disks, int32_t* changed)
@@ -92,6 +114,7 @@ bool rescan_block_devices(disk_sets* disks, int32_t* changed)
         }
     }
     block_list = found;
+    any |= offer_again(disks);
     // Those that came and went between two rescans, so that no list ever held them.
     any |= forget_pulled_disks(disks);
     if (any) {
@@ -100,7 +123,15 @@ bool rescan_block_devices(disk_sets* disks, int32_t* changed)
     return true;
 }
 
+void rescan_offer_again(const char* dev_name)
+{
+    if (offered_again.count < OFFERS_MAX) {
+        text_copy(offered_again.dev_names[offered_again.count++], dev_name);
+    }
+}
+
 void rescan_reset()
 {
     block_list = {};
+    offered_again = {};
 }

@@ -9,5 +9,8 @@
 // when there were any. False when /sys/block cannot be read whole, and nothing is done.
 [[nodiscard]] bool rescan_block_devices(disk_sets* disks, int32_t* changed);
 
+// Has the next call offer the disk or partition to the inventory as if it came then.
+void rescan_offer_again(const char* dev_name);
+
 // Forgets the previous call. For tests.
 void rescan_reset();

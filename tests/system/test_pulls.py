@@ -187,7 +187,7 @@ def test_a_disk_that_bounces_returns_to_its_directory(world, start_daemon, patte
     assert rows(world) == before
 
 
-def test_late_messages_about_a_pull_do_not_remove_the_disk_that_has_the_name_now(
+def test_late_messages_about_a_pull_cost_the_disk_that_has_the_name_now_a_moment(
         world, start_daemon):
     disk, _, daemon = two_disks(world, start_daemon)
     messages = world.pull(disk)

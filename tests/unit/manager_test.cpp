@@ -520,9 +520,18 @@ TEST_F(Manager, an_add_for_another_disk_under_a_known_name_takes_it_in)
     const std::string log = capture_stdout([&] { dispatch(EVENT_DISK_ADD, "sda1"); });
     EXPECT_TRUE(contains(log, "]disk was replaced, dev = sda\n"));
     EXPECT_EQ(manager->disks.entries[0].disk.parts[0].part.total_len, 300000U);
-    // The messages of the pull come only now.
+    // The messages of the pull come only now, and cost the new one a moment.
     dispatch(EVENT_DISK_REMOVE_DEV, "sda1");
-    EXPECT_EQ(manager->disks.entries[0].disk.parts[0].in_use, 1);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_EQ(manager->disks.entries[0].disk.parts[0].part.total_len, 300000U);
+    // Through the other pipes somebody asks for it.
+    manager->pipes.event_fd = manager->pipes.fd_remove;
+    dispatch(EVENT_DISK_REMOVE_DEV, "sda1");
+    manager->t_rescan = NOW - 8;
+    manager_idle(manager);
+    EXPECT_EQ(disk_sets_count(&manager->disks), 0);
 }
 
 TEST_F(Manager, a_disk_that_a_rescan_took_in_is_mounted_before_anything_is_published)

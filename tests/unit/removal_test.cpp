@@ -220,39 +220,6 @@ TEST_F(Removal, remove_dev_of_a_vanished_disk_with_a_filesystem_of_its_own_keeps
     EXPECT_EQ(disk_sets_count(&sets), 1);
 }
 
-TEST_F(Removal, a_disk_that_waits_for_its_first_mount_pass_outlives_the_removal_of_another)
-{
-    sets.sorted_once = 1;
-    for (const bool by_directory : {false, true}) {
-        put_mounted_disk(0, "sda", {0});
-        plug_disk("sdb", R"(PTTYPE="dos")", 5000);
-        plug_part("sdb", "sdb1", R"(UUID="U-B" TYPE="ext4")", 4000);
-        disk_sets_add_dev(&sets, "sdb");
-        if (by_directory) {
-            remove_disk(&sets, "disk1_part1");
-        } else {
-            remove_dev(&sets, "sda1");
-        }
-        EXPECT_EQ(disk_sets_find_disk(&sets, "sda"), nullptr);
-        disk_entry* waiting = disk_sets_find_disk(&sets, "sdb");
-        ASSERT_NE(waiting, nullptr);
-        EXPECT_STREQ(waiting->disk.parts[0].part.uid, "U-B");
-        disk_entry_clear(waiting);
-    }
-}
-
-TEST_F(Removal, a_disk_that_waits_and_is_removed_itself_stays_removed)
-{
-    plug_disk("sdb", R"(PTTYPE="dos")", 5000);
-    plug_part("sdb", "sdb1", R"(UUID="U-B" TYPE="ext4")", 4000);
-    for (const char* name : {"sdb1", "sdb"}) {
-        disk_sets_add_dev(&sets, "sdb");
-        ASSERT_EQ(disk_sets_count(&sets), 1);
-        remove_dev(&sets, name);
-        EXPECT_EQ(disk_sets_count(&sets), 0) << name;
-    }
-}
-
 TEST_F(Removal, remove_dev_of_an_unknown_device_changes_nothing)
 {
     put_mounted_disk(0, "sda", {0});

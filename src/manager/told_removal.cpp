@@ -1,0 +1,47 @@
+#include "manager/told_removal.h"
+
+#include "disk/pulled.h"
+#include "disk/removal.h"
+#include "disk/waiting.h"
+#include "log/log.h"
+#include "manager/rescan.h"
+#include "manager/services.h"
+
+namespace {
+
+// The file services must not hold files open while something is unmounted. A disk that waits for
+// its first mount pass is none of the removal's business.
+void remove_bracketed(disk_sets* sets, const char* name, int (*remove)(disk_sets*, const char*))
+{
+    services_stop();
+    const waiting_disks waiting = find_waiting_disks(sets, name);
+    remove(sets, name);
+    bring_back_waiting_disks(sets, waiting);
+    services_start();
+}
+
+}  // namespace
+
+void remove_told_dev(disk_sets* sets, const char* dev_name, bool from_hotplug)
+{
+    const bool may_be_late = may_mean_former_disk(sets, dev_name) && from_hotplug;
+    remove_bracketed(sets, dev_name, remove_dev);
+    if (may_be_late) {
+        log_warn("removal of a former disk, dev = %s\n", dev_name);
+        rescan_offer_again(dev_name);
+    }
+}
+
+void remove_told_dir(disk_sets* sets, const char* dir_name)
+{
+    remove_bracketed(sets, dir_name, remove_disk);
+}
+
+void remove_told_all(disk_sets* sets)
+{
+    services_stop();
+    safe_remove_all(sets);
+    // That goes through what the kernel lists; nobody looks for the others while parked.
+    forget_pulled_disks(sets);
+    services_start();
+}
