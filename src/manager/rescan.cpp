@@ -97,12 +97,13 @@ bool rescan_block_devices(disk_sets* disks, int32_t* changed)
     if (!read_block_slots(&found)) {
         return false;
     }
-    // An old record would make the inventory refuse the new disk of its name.
-    bool any = forget_replaced_disks(disks);
+    bool any = false;
     // Empty slots are compared like names on purpose: when a full list shrinks, "" is offered once,
     // and no device is called that.
     for (const block_slot& slot : found.slots) {
         if (is_new(slot)) {
+            // An old record would make the inventory refuse the new disk of its name.
+            forget_replaced_disks(disks);
             disk_sets_add_dev(disks, slot.name);
             any = true;
         }

@@ -290,7 +290,10 @@ class World(state.Observed):
 
     def diagnosis(self):
         """What to print beside a failed test."""
-        lines = [f"{entry.dev} on {entry.path} type {entry.fs}" for entry in self.mounts()]
+        try:
+            lines = [f"{entry.dev} on {entry.path} type {entry.fs}" for entry in self.mounts()]
+        except OSError as error:
+            lines = [f"the world is gone: {error}"]
         lines += [f"/sys/block: {' '.join(self.sysfs.names())}"]
         for daemon in self._daemons:
             lines += [f"--- {daemon.log_path.name}, exit status {daemon.returncode}:",
