@@ -13,6 +13,7 @@
 #include "util/paths.h"
 #include "util/pause.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 namespace {
 
@@ -20,6 +21,9 @@ namespace {
 using forget_operation = bool (*)(disk_sets* sets);
 
 constexpr int32_t ROOT_PART_NUMBER = 1;
+
+// A look at once waits for nothing and is no try.
+static_assert(WAITS.mount.size() == MOUNT_WAIT_TRIES + (WAITS.mount[0] == 0 ? 1 : 0));
 
 // Proposes the directory that the part's numbers stand for.
 void plan_mount_path(part_info* part)
@@ -51,8 +55,8 @@ void run_mount(const char* format, const char* dev_path, const char* mount_path)
 // A userspace filesystem takes its time to appear in the mount table.
 bool wait_until_mounted(const char* dev_path)
 {
-    for (int i = 0; i < MOUNT_WAIT_TRIES; ++i) {
-        pause_seconds(MOUNT_WAIT_SECONDS);
+    for (const int milliseconds : WAITS.mount) {
+        pause_milliseconds(milliseconds);
         if (is_dev_mounted(dev_path) == YES) {
             return true;
         }

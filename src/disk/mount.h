@@ -3,8 +3,8 @@
 
 #include "disk/disk_sets.h"
 
-constexpr int MOUNT_WAIT_TRIES = 9;    // looks at the mount table after the mount command,
-constexpr int MOUNT_WAIT_SECONDS = 2;  // each after a pause of this length
+// Looks at the mount table after the mount command, each after a pause: util/waits.h.
+constexpr int MOUNT_WAIT_TRIES = 9;
 
 // The whole mount pass: drops small partitions, sorts and numbers the disks the first time, mounts
 // what is not mounted yet and refreshes the sizes. Blocks up to 18 s for each partition that does

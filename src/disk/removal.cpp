@@ -9,8 +9,24 @@
 #include "util/paths.h"
 #include "util/pause.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 namespace {
+
+// True when the device left the mount table after an umount command. False when it is time for the
+// next one, which begins with a look of its own.
+bool wait_until_gone(const char* dev_path)
+{
+    char mounted_at[MOUNT_PATH_SIZE]{};
+    for (const int milliseconds : WAITS.umount.first(WAITS.umount.size() - 1)) {
+        pause_milliseconds(milliseconds);
+        if (get_dev_mount_path(dev_path, mounted_at) != YES) {
+            return true;
+        }
+    }
+    pause_milliseconds(WAITS.umount.back());
+    return false;
+}
 
 void umount_until_gone(const char* dev_path)
 {
@@ -20,7 +36,9 @@ void umount_until_gone(const char* dev_path)
             return;
         }
         fs_umount(mounted_at);
-        pause_seconds(1);
+        if (wait_until_gone(dev_path)) {
+            return;
+        }
     }
 }
 

@@ -23,6 +23,9 @@ constexpr uint32_t PIPE_CAPACITY = 65536;
 
 constexpr int FIFO_TRIES = 3;
 
+constexpr int MS_PER_SECOND = 1000;
+constexpr suseconds_t US_PER_MS = 1000;
+
 struct pipe_place {
     const char* path;
     int32_t event_pipes::*fd;
@@ -100,6 +103,10 @@ void prepare_sets(event_pipes* pipes)
         pipes->max_fd = largest(pipes->max_fd, fd);
     }
     pipes->timeout = {EVENT_WAIT_SECONDS, 0};
+    if (pipes->wait_ms > 0) {
+        pipes->timeout = {pipes->wait_ms / MS_PER_SECOND,
+                          static_cast<suseconds_t>(pipes->wait_ms % MS_PER_SECOND) * US_PER_MS};
+    }
 }
 
 // Reads one message byte by byte. A line without its terminator is lost: its writer broke off.

@@ -39,6 +39,7 @@ struct event_pipes {
     int32_t max_fd;
     disk_event event;  // the last parsed event
     int32_t event_fd;  // the pipe that its message came from
+    int32_t wait_ms;   // how long the next cycle waits; 0 for EVENT_WAIT_SECONDS
 };
 
 // What event_receive answers when there is an event.
@@ -50,9 +51,9 @@ int event_pipes_open(event_pipes* pipes);
 // Closes and clears. The pipes stay in the file system. Always 0, 1 for a null argument.
 int event_pipes_close(event_pipes* pipes);
 
-// One cycle: waits up to 3 s and reads at most one message into buffer (size bytes, zeroed by the
-// caller), which stays terminated; a longer line is cut and its rest dropped. The number of bytes
-// stored, 0 when there was no message, -1 on a pipe error.
+// One cycle: waits as long as the record says and reads at most one message into buffer (size
+// bytes, zeroed by the caller), which stays terminated; a longer line is cut and its rest dropped.
+// The number of bytes stored, 0 when there was no message, -1 on a pipe error.
 int event_wait(event_pipes* pipes, char* buffer, uint32_t size);
 
 // EVENT_RECEIVED when a valid event is now in the record's event, else 0.

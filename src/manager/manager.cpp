@@ -17,6 +17,7 @@
 #include "util/pause.h"
 #include "util/process.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 namespace {
 
@@ -100,6 +101,10 @@ void report_signals()
 bool receive_event(disk_manager* manager)
 {
     report_signals();
+    // Only an active manager works off what is due: any other would find it due for ever.
+    const bool is_due = manager->update_due == 1 || manager->changed == 1;
+    manager->pipes.wait_ms =
+        is_due && manager->state == MANAGER_ACTIVE ? WAITS.work_due : WAITS.idle;
     const bool received = event_receive(&manager->pipes) == EVENT_RECEIVED;
     report_signals();
     return received;

@@ -1,5 +1,5 @@
-// Waiting.
+// Waiting. Both sleep for the whole time, also when signals arrive meanwhile.
 #pragma once
 
-// Sleeps for that many whole seconds, also when signals arrive meanwhile.
 void pause_seconds(int seconds);
+void pause_milliseconds(int milliseconds);

@@ -101,6 +101,11 @@ void pause_seconds(int seconds)
     static_cast<void>(seconds);
 }
 
+void pause_milliseconds(int milliseconds)
+{
+    static_cast<void>(milliseconds);
+}
+
 const std::string FIELD_SEPARATOR = "\xff\x1f";
 
 void require(bool kept, const char* promise, const char* file, int line)

@@ -178,6 +178,19 @@ TEST_F(EventPipes, a_cycle_without_a_message_lasts_three_seconds)
     EXPECT_LT(waited, std::chrono::seconds(6));
 }
 
+TEST_F(EventPipes, a_cycle_lasts_as_long_as_the_record_says)
+{
+    char buffer[EVENT_LINE_SIZE]{};
+    for (const int32_t wait_ms : {100, 1100}) {
+        pipes.wait_ms = wait_ms;
+        const auto start = std::chrono::steady_clock::now();
+        EXPECT_EQ(event_wait(&pipes, buffer, sizeof(buffer)), 0);
+        const auto waited = std::chrono::steady_clock::now() - start;
+        EXPECT_GE(waited, std::chrono::milliseconds(wait_ms - 10));
+        EXPECT_LT(waited, std::chrono::milliseconds(wait_ms + 1500));
+    }
+}
+
 TEST_F(EventPipes, each_of_the_four_terminators_ends_a_message)
 {
     for (const char end : {'\n', '\r', ';', '\0'}) {

@@ -25,6 +25,7 @@
 #include "util/fs_code.h"
 #include "util/paths.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 using support::capture_stdout;
 using support::contains;
@@ -277,11 +278,11 @@ TEST_F(Manager, a_safe_removal_unmounts_all_publishes_and_parks_until_the_next_a
     EXPECT_EQ(read_file(DISK_NUM_FILE), "0");
 
     stubs.forget_calls();
-    the_clock.slept = 0;
+    the_clock.slept_ms = 0;
     the_clock.now += 1000;
     const std::string parked = capture_stdout([&] { EXPECT_EQ(manager_idle(manager), 0); });
     EXPECT_TRUE(contains(parked, "]disk safe remove ...\n"));
-    EXPECT_EQ(the_clock.slept, 1);
+    EXPECT_EQ(the_clock.slept_ms, 1000);
     EXPECT_TRUE(stubs.calls().empty());
 
     dispatch(EVENT_DISK_ADD, "sda");
@@ -659,6 +660,37 @@ TEST_F(Manager, many_safe_removals_do_not_overflow_the_silence_limit)
     };
     manager_event_loop(manager);
     EXPECT_EQ(times_called("pidof tarn_nas_sys"), 0);
+}
+
+TEST_F(Manager, only_an_active_manager_with_something_to_do_shortens_its_wait)
+{
+    struct wait_case {
+        int32_t state;
+        int32_t changed;
+        int32_t update_due;
+        int expected;
+    };
+    for (const wait_case& one : {wait_case{MANAGER_ACTIVE, 0, 0, WAITS.idle},
+                                 wait_case{MANAGER_ACTIVE, 1, 0, WAITS.work_due},
+                                 wait_case{MANAGER_ACTIVE, 0, 1, WAITS.work_due},
+                                 wait_case{MANAGER_ACTIVE, 1, 1, WAITS.work_due},
+                                 wait_case{MANAGER_INITIALISED, 1, 1, WAITS.idle},
+                                 wait_case{MANAGER_SAFE_REMOVED, 1, 1, WAITS.idle}}) {
+        manager_life_reset();
+        manager->state = one.state;
+        manager->changed = one.changed;
+        manager->update_due = one.update_due;
+        send("#heart_beat\n");
+        the_clock.looks = 0;
+        the_clock.on_look = [&](int look) {
+            if (look == 2) {
+                running = 0;
+            }
+        };
+        capture_stdout([&] { manager_event_loop(manager); });
+        EXPECT_EQ(manager->pipes.wait_ms, one.expected)
+            << one.state << one.changed << one.update_due;
+    }
 }
 
 TEST_F(Manager, a_stopped_loop_ends_at_the_top_of_its_cycle)

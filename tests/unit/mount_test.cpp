@@ -22,6 +22,7 @@
 #include "util/fs_code.h"
 #include "util/paths.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 using support::capture_stdout;
 using support::contains;
@@ -94,7 +95,7 @@ TEST_F(Mount, a_partition_is_mounted_in_its_directory_with_its_filesystems_comma
     ASSERT_EQ(stat("/tmp/mountd/disk3_part2", &info), 0);
     EXPECT_EQ(info.st_mode & 0666U, 0666U);
     EXPECT_EQ(remembered("U-1"), "sda1 disk3_part2 /tmp/mountd/disk3_part2 yes");
-    EXPECT_EQ(support::the_clock.slept, 2) << "one pause before the first look";
+    EXPECT_EQ(support::the_clock.slept_ms, WAITS.mount[0]) << "one pause before the first look";
     EXPECT_TRUE(contains(log, "*** *** *** mount part, status = 0\n"));
     EXPECT_EQ(support::count_of(log, "mout path = /tmp/mountd/disk3_part2\n"), 2);
     EXPECT_TRUE(contains(log, "mount OK, /dev/sda1 ==> /tmp/mountd/disk3_part2\n"));
@@ -174,13 +175,13 @@ TEST_F(Mount, an_unknown_filesystem_stays_unmounted_and_gets_no_directory)
     EXPECT_FALSE(std::filesystem::exists("/tmp/mountd/disk1_part1"));
 }
 
-TEST_F(Mount, a_mount_that_never_appears_is_given_up_after_nine_looks_and_18_seconds)
+TEST_F(Mount, a_mount_that_never_appears_is_given_up_after_18_seconds)
 {
     support::write_file(support::MOUNT_REFUSES, "");
     part_info* part = put_ready_part(0, 1, "U-1");
     const std::string log = capture_stdout([&] { mount_part(part); });
     EXPECT_EQ(part->mount_status, 0);
-    EXPECT_EQ(support::the_clock.slept, 18);
+    EXPECT_EQ(support::the_clock.slept_ms, 18000);
     EXPECT_TRUE(contains(log, "]=== === === mount ERROR, /dev/sda1 ==> /tmp/mountd/disk1_part1\n"));
     EXPECT_TRUE(std::filesystem::exists("/tmp/mountd/disk1_part1"));
     EXPECT_EQ(remembered("U-1"), "sda1 disk1_part1 /tmp/mountd/disk1_part1 yes");
@@ -194,15 +195,15 @@ TEST_F(Mount, a_mount_that_appears_late_is_waited_for)
 {
     support::write_file(support::MOUNT_REFUSES, "");
     part_info* part = put_ready_part(0, 1, "U-1");
-    int sleeps = 0;
+    size_t sleeps = 0;
     support::the_clock.on_sleep = [&] {
-        if (++sleeps == 9) {
+        if (++sleeps == WAITS.mount.size()) {
             add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
         }
     };
     mount_part(part);
     EXPECT_EQ(part->mount_status, 1);
-    EXPECT_EQ(support::the_clock.slept, 18);
+    EXPECT_EQ(support::the_clock.slept_ms, 18000);
 }
 
 TEST_F(Mount, without_a_row_the_new_name_is_kept_and_stored)

@@ -59,7 +59,7 @@ protected:
         mount_all(&sets);
         ASSERT_EQ(disk_of(disk)->parts[0].part.mount_status, 1);
         stubs.forget_calls();
-        support::the_clock.slept = 0;
+        support::the_clock.slept_ms = 0;
     }
 
     disk_obj* disk_of(const std::string& disk)
@@ -149,17 +149,17 @@ TEST_F(Pulled, a_disk_whose_nodes_have_gone_gets_a_second_to_leave_itself)
     support::the_clock.on_sleep = [&] { pull("sda"); };
     EXPECT_TRUE(forget_leaving_disks(&sets));
     EXPECT_EQ(disk_sets_count(&sets), 0);
-    EXPECT_EQ(support::the_clock.slept, 1);
+    EXPECT_EQ(support::the_clock.slept_ms, 1000);
 }
 
 TEST_F(Pulled, nobody_waits_when_every_disk_has_its_nodes)
 {
     take_in_and_mount("sda");
     EXPECT_FALSE(forget_leaving_disks(&sets));
-    EXPECT_EQ(support::the_clock.slept, 0);
+    EXPECT_EQ(support::the_clock.slept_ms, 0);
     support::remove_all("/dev/sda1");
     EXPECT_FALSE(forget_leaving_disks(&sets));
-    EXPECT_EQ(support::the_clock.slept, 1);
+    EXPECT_EQ(support::the_clock.slept_ms, 1000);
     EXPECT_NE(disk_of("sda"), nullptr);
 }
 

@@ -60,7 +60,7 @@ extern "C" int nanosleep(const timespec* requested_time, timespec* remaining)
         errno = clock_nanosleep(CLOCK_MONOTONIC, 0, requested_time, remaining);
         return errno == 0 ? 0 : -1;
     }
-    the_clock.slept += requested_time->tv_sec;
+    the_clock.slept_ms += requested_time->tv_sec * 1000 + requested_time->tv_nsec / 1000000;
     if (the_clock.on_sleep) {
         the_clock.on_sleep();
     }

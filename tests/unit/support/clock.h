@@ -1,6 +1,7 @@
 // The test program's own time() and nanosleep(): real unless a test says otherwise.
 #pragma once
 
+#include <cstdint>
 #include <ctime>
 #include <functional>
 
@@ -13,7 +14,7 @@ struct clock_control {
     int looks = 0;                     // calls of time() while the clock is fake
     std::function<void(int)> on_look;  // told the number of the look, from 1
     bool skip_sleeps = false;
-    time_t slept = 0;  // seconds asked for while sleeps are skipped
+    int64_t slept_ms = 0;  // asked for while sleeps are skipped
     std::function<void()> on_sleep;
 };
 
