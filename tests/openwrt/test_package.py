@@ -105,6 +105,12 @@ def test_the_stand_in_is_provided_by_the_package_itself(buildroot):
     assert buildroot.provides(PACKAGE) == {"libtarn-utils.so"}
 
 
+def test_a_question_of_the_menu_chooses_the_prompt_build(buildroot):
+    assert "config TARN_NAS_DISKMANAGER_PROMPT\n" in (FEED_DIR / "Config.in").read_text()
+    for setting, waits in (((), "steady"), (("CONFIG_TARN_NAS_DISKMANAGER_PROMPT=y",), "prompt")):
+        assert f"-DDISKMANAGER_WAITS={waits}" in buildroot.show(PACKAGE, *setting)["CMAKE_OPTIONS"].split()
+
+
 def test_cmake_knows_each_option_that_it_is_given(buildroot):
     known = (CHECKOUT / "CMakeLists.txt").read_text()
     words = buildroot.show(PACKAGE)["CMAKE_OPTIONS"].split()
