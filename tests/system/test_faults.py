@@ -4,10 +4,10 @@ import subprocess
 
 import pytest
 from shared.busy import hold
+from shared.waits import looks_after_mount
 
 from world import Partition
 
-LOOKS = 9
 FURTHER_UMOUNTS = 10
 CALLS = "/run/world/mount-calls.txt"
 
@@ -36,7 +36,7 @@ def mount_calls(world):
 
 
 @pytest.mark.needs_fs("ext4")
-def test_a_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next_pass(
+def test_a_mount_that_fails_is_looked_for_for_18_seconds_and_tried_again_at_the_next_pass(
         world, start_daemon):
     stub_mount(world, "/dev/sda1", 1)
     world.plug(world.partitioned_disk(Partition("ext4", 1200, "DATA")), "sda")
@@ -49,10 +49,10 @@ def test_a_mount_that_fails_is_looked_for_nine_times_and_tried_again_at_the_next
         ("disk1_part1", "yes")]
 
     tried = daemon.log().split("exec cmd = mount -t ext4")[1].split("mount ERROR")[0]
-    assert tried.count("exec cmd = mount > /tmp/mount.txt") == LOOKS
+    assert tried.count("exec cmd = mount > /tmp/mount.txt") == looks_after_mount(world.program)
     daemon.wait_log("mount OK, /dev/sda1 ==> /tmp/mountd/disk1_part1", 30)
     first, second = mount_calls(world)
-    # Nine looks 2 s apart and a cycle; the next pass but one would be 36 s away.
+    # The looks of 18 s and a cycle; the next pass but one would be 36 s away.
     assert 18 <= second - first < 36
     assert world.mounted() == {"/dev/sda1": "/tmp/mountd/disk1_part1"}
     world.wait(lambda: world.parts()["sda1"].free_size > 1000, 30, "its free space in disk.json")

@@ -12,6 +12,8 @@ STATIC = Path(os.environ.get("TARN_DAEMON_STATIC") or _BUILT_STATIC)
 
 def why_not(program):
     """Why one of the two is not to be tested, as a text; empty when it is."""
+    if program == _BUILT_STATIC and os.environ.get("TARN_DAEMON"):
+        return "TARN_DAEMON names the only program to test (TARN_DAEMON_STATIC adds a static one)"
     if not program.exists():
         return f"{program} is not built (scripts/cross x86_64 makes the static one)"
     # scripts/test does not build it; elsewhere its age says nothing.
