@@ -67,6 +67,10 @@ class Browser:
         self.run("var then = Date.now; Date.now = function() { return then() + arguments[0] * 1000; }"
                  ".bind(null, arguments[0]);", seconds)
 
+    def pause(self, seconds):
+        """Let the page go on for so long."""
+        self.driver.execute_async_script("setTimeout(arguments[1], arguments[0] * 1000)", seconds)
+
     def picture(self, name):
         """Leave a picture of the page in the results."""
         RESULTS.mkdir(parents=True, exist_ok=True)

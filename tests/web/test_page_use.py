@@ -53,7 +53,7 @@ def test_it_looks_every_five_seconds_and_not_at_all_when_hidden(browser, server,
     browser.wait(lambda: len(server.calls) == seen + 1, "one look", 6)
     browser.run("Object.defineProperty(document, 'hidden', { configurable: true, get: function() { return true; } })")
     seen = len(server.calls)
-    browser.driver.execute_async_script("setTimeout(arguments[0], 6000)")
+    browser.pause(6)
     assert len(server.calls) == seen
     browser.run("delete document.hidden; document.dispatchEvent(new Event('visibilitychange'))")
     browser.wait(lambda: len(server.calls) > seen, "a look at once", 2)
