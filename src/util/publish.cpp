@@ -15,6 +15,7 @@ namespace {
 
 // As fopen makes a file, less the umask.
 constexpr mode_t NEW_FILE_MODE = 0666;
+constexpr mode_t PERMISSIONS = 07777;
 
 bool write_whole(int fd, const char* text)
 {
@@ -50,7 +51,7 @@ bool keep_access(int fd, const char* path)
     if (!has_owner && fchown(fd, old.st_uid, old.st_gid) != 0) {
         return false;
     }
-    return fresh.st_mode == old.st_mode || fchmod(fd, old.st_mode & ALLPERMS) == 0;
+    return fresh.st_mode == old.st_mode || fchmod(fd, old.st_mode & PERMISSIONS) == 0;
 }
 
 }  // namespace
