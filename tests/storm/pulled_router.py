@@ -124,7 +124,7 @@ class PulledRouter:
                 self.daemon.wait_log(f" {device} /tmp/mountd/", 25, mark)
             self._sleep_until(time.monotonic() - self._begun + self.random.uniform(0, seconds))
             self._pull(victim)
-        self.world.path(SLOW_MOUNT).unlink()
+        self.world.path(SLOW_MOUNT).unlink(missing_ok=True)
         return self._result
 
     @contextlib.contextmanager

@@ -381,7 +381,10 @@ class World(state.Observed):
         os.mknod(self.path(f"/dev/{name}"), stat.S_IFBLK | 0o660, loop.devno)
 
     def _kill_group(self, process):
-        # The group holds nsenter and what it started, inside and outside alike.
+        # The group holds nsenter and what it started, inside and outside alike. Once its leader has
+        # been waited for, its number may be that of another group by now, another world's even.
+        if process.poll() is not None:
+            return
         with contextlib.suppress(ProcessLookupError):
             os.killpg(process.pid, 9)
         process.wait(30)
