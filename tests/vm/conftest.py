@@ -46,15 +46,20 @@ def bare_vm(machine_files):
 
 
 @pytest.fixture(scope="session")
-def daemon_vm(machine_files, tmp_path_factory):
-    """One machine with the release daemon in it for all tests; `daemon` cleans it up between them."""
+def daemon_files(machine_files, tmp_path_factory):
+    """What puts the release daemon into a machine."""
     if not RELEASE.exists():
         pytest.skip(f"no daemon: {RELEASE} is not built")
 
     overlay = tmp_path_factory.mktemp("vm") / "daemon.cpio"
     pack_daemon(overlay)
+    return overlay
 
-    with Vm(overlay) as vm:
+
+@pytest.fixture(scope="session")
+def daemon_vm(daemon_files):
+    """One machine with the release daemon in it for all tests; `daemon` cleans it up between them."""
+    with Vm(daemon_files) as vm:
         yield vm
 
 

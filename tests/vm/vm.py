@@ -117,10 +117,15 @@ class Result:
 
 
 class Vm:
-    """One running machine; usable in a `with` statement."""
+    """One running machine; usable in a `with` statement.
 
-    def __init__(self, overlay=None):
+    overlay    an archive that is unpacked over the root file system
+    boot_disk  the image of a USB disk whose first partition, an ext4 one, becomes the root file system
+    """
+
+    def __init__(self, overlay=None, boot_disk=None):
         self.overlay = overlay
+        self.boot_disk = boot_disk
         self.accelerator = usable_accelerator()
         self.boot_seconds = None
         self.process = None
@@ -230,7 +235,8 @@ class Vm:
         # A test run that is killed takes its machine along.
         command = ["setpriv", "--pdeathsig", "KILL", "qemu-system-x86_64",
                    "-nodefaults", "-no-user-config", "-display", "none", "-no-reboot", "-machine", "q35", "-m", "256", "-smp", "1", "-kernel", str(KERNEL),
-                   "-append", "console=ttyS0 quiet loglevel=4 panic=-1 usb_storage.delay_use=0 tsc=reliable"]
+                   "-append", "console=ttyS0 quiet loglevel=4 panic=-1 usb_storage.delay_use=0 tsc=reliable"
+                   + (" boot_disk=sda1" if self.boot_disk else "")]
         command += ["-accel", self.accelerator, "-cpu", "host" if self.accelerator == "kvm" else "max"]
 
         if self.overlay:
@@ -245,6 +251,11 @@ class Vm:
                     "-device", "qemu-xhci,id=xhci,p2=8,p3=8",
                     "-drive", "if=none,id=slot",
                     "-device", "sdhci-pci", "-device", "sd-card,id=card,drive=slot"]
+
+        if self.boot_disk:
+            command += ["-drive", f"if=none,id=boot,format=raw,file={self.boot_disk}",
+                        "-device", "usb-storage,drive=boot,bus=xhci.0,removable=on"]
+
         return command
 
     def _join(self, parts):
