@@ -6,6 +6,7 @@ import time
 from subprocess import DEVNULL, PIPE
 
 import pytest
+from shared.own_disk import run_from
 from web.exchange import words
 from web.router import PLUGIN
 
@@ -107,6 +108,19 @@ def test_what_the_daemon_does_not_use_has_its_reason(world, plugin, listener):
     publish(world, [part("sda1", "disk1_part1")])
     assert plugin.unused() == {"sda2": "small", "sda3": "removed", "sdb": "no_filesystem",
                                "nvme0n1": "name", "sdd1": "elsewhere", "sde1": "busy", "mmcblk1": "system"}
+
+
+@pytest.mark.parametrize("directory", ["/", "/rom", "/overlay", "/boot"])
+def test_a_disk_with_a_part_of_the_router_on_a_partition_is_its_own(world, plugin, listener, directory):
+    run_from(world, "-t", "tmpfs", "router")
+    add_disk(world, "sda", 4000, [1200])
+    world.sh("mkdir /run/beside && mount -t tmpfs beside /run/beside")
+    if directory != "/":
+        world.run("mount", "-t", "tmpfs", "own", directory)
+    add_disk(world, "mmcblk0", 4000, [500])
+    for disk, name, place in (("mmcblk0", "mmcblk0p2", directory), ("sda", "sda2", "/run/beside")):
+        world.sysfs.add_partition(disk, name, 2, 2048, 1200 * SECTORS, os.stat(world.path(place)).st_dev)
+    assert plugin.unused() == {"sda1": "removed", "sda2": "removed", "mmcblk0": "system"}
 
 
 def test_sizes_of_what_is_not_used_are_the_kernels(world, plugin, listener):
