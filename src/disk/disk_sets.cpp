@@ -132,6 +132,9 @@ int disk_sets_drop_small_parts(disk_sets* sets)
 
 void disk_sets_dump(const disk_sets* sets)
 {
+    if (sets == nullptr) {
+        return;
+    }
     for (const disk_entry& entry : sets->entries) {
         if (entry.in_use == 1) {
             disk_obj_dump(&entry.disk);

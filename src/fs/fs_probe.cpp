@@ -167,7 +167,7 @@ constexpr const probe* probe_of(fs_code code)
 {
     for (const probe& row : PROBES) {
         for (const fs_code found : row.codes) {
-            if (found == code) {
+            if (found == code && code != FS_NONE) {
                 return &row;
             }
         }

@@ -71,14 +71,14 @@ const char* fs_type_name(fs_code fs_type)
 fs_code fs_detect_type(const char* dev_path)
 {
     log_heading(dev_path);
-    const int fd = open(dev_path, O_RDONLY | O_CLOEXEC);
+    fd_guard fd(open(dev_path, O_RDONLY | O_CLOEXEC));
     if (fd < 0) {
         perror("open device err!\n");
         log_info("err, open dev = %s\n", dev_path);
         return FS_NONE;
     }
     fs_code fs_type = fs_probe_all(fd);
-    close(fd);
+    fd.reset(-1);
 
     // The ext superblock only tells that blkid is to be asked which member of the family it is.
     const bool ask_blkid = fs_type == FS_NONE || is_ext(fs_type);

@@ -65,6 +65,21 @@ void query_blkid(const char* format, const char* dev_name, const char* key, char
     log_info("get %s, %s = %.*s\n", dev_name, key, static_cast<int>(size), out);
 }
 
+// True, which is logged, when the disk's directory holds the partition.
+bool is_parent(const char* root_dev, const char* part_name)
+{
+    if (dev_name_is_disk(root_dev) != MATCHES) {
+        return false;
+    }
+    char path[PATH_SIZE];
+    path_sys_disk(path, root_dev);
+    if (dir_has_entry(path, part_name) != MATCHES) {
+        return false;
+    }
+    log_info("find dev = %s, in root path = %s\n", part_name, path);
+    return true;
+}
+
 }  // namespace
 
 int dev_name_is_disk(const char* name)
@@ -89,21 +104,20 @@ int sys_block_has_dev(const char* name)
 
 int sys_block_find_parent(const char* part_name, char* out, size_t size)
 {
-    dir_stream dir(SYS_BLOCK);
-    if (dir.stream == nullptr) {
-        log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return NO_MATCH;
-    }
-    while (const char* disk_name = dir.next_name()) {
-        if (dev_name_is_disk(disk_name) != MATCHES) {
-            continue;
+    for (int walk = 0; walk < DIR_WALKS; ++walk) {
+        dir_stream dir(SYS_BLOCK);
+        if (dir.stream == nullptr) {
+            log_err("open dir err, dir = %s\n", SYS_BLOCK);
+            return NO_MATCH;
         }
-        char path[PATH_SIZE];
-        path_sys_disk(path, disk_name);
-        if (dir_has_entry(path, part_name) == MATCHES) {
-            log_info("find dev = %s, in root path = %s\n", part_name, path);
-            text_copy({out, size}, disk_name);
-            return MATCHES;
+        while (const char* root_dev = dir.next_name()) {
+            if (is_parent(root_dev, part_name)) {
+                text_copy({out, size}, root_dev);
+                return MATCHES;
+            }
+        }
+        if (!dir.failed) {
+            break;
         }
     }
     return NO_MATCH;

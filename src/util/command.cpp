@@ -3,6 +3,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "util/guard.h"
 #include "util/paths.h"
 #include "util/text.h"
 
@@ -87,7 +88,7 @@ bool command_format(std::span<char> out, const char* format,
             command.append(c, 1);
             continue;
         }
-        if (word == words.end() || !is_taken(*word, quote)) {
+        if (word == words.end() || *word == nullptr || !is_taken(*word, quote)) {
             text_clear(out);
             return false;
         }
@@ -100,11 +101,11 @@ bool command_format(std::span<char> out, const char* format,
 
 char* command_of_word(const char* format, const char* word)
 {
-    const size_t size = strlen(format) + strlen(word) + 1;
-    auto* command = static_cast<char*>(malloc(size));
-    if (command != nullptr && !command_format({command, size}, format, {word})) {
-        free(command);
+    if (word == nullptr) {
         return nullptr;
     }
-    return command;
+    const size_t size = strlen(format) + strlen(word) + 1;
+    text_guard command(static_cast<char*>(malloc(size)));
+    const bool done = command != nullptr && command_format({command.held, size}, format, {word});
+    return done ? command.release() : nullptr;
 }

@@ -32,6 +32,13 @@ std::string made_of_word(const char* format, const char* word)
 
 }  // namespace
 
+TEST(CommandFormat, a_null_word_is_refused)
+{
+    EXPECT_EQ(made("umount %s", {nullptr}), "refused");
+    EXPECT_EQ(made("mkdir -p '%s'", {nullptr}), "refused");
+    EXPECT_EQ(made_of_word("mkdir -p '%s'", nullptr), "refused");
+}
+
 TEST(CommandFormat, fills_the_places_in_their_order)
 {
     EXPECT_EQ(made("mount > x", {}), "mount > x");

@@ -239,6 +239,7 @@ TEST_F(DiskSets, the_dump_shows_every_disk_in_use)
 
 TEST_F(DiskSets, a_null_table_is_answered_with_1_or_nothing)
 {
+    disk_sets_dump(nullptr);
     EXPECT_EQ(disk_sets_init(nullptr), 1);
     EXPECT_EQ(disk_sets_free(nullptr), 1);
     EXPECT_EQ(disk_sets_get_free_entry(nullptr), nullptr);

@@ -322,8 +322,11 @@ TEST(FsProbe, one_probe_serves_the_whole_ext_family_and_none_serves_no_filesyste
     for (fs_code code : {FS_EXT2, FS_EXT3, FS_EXT4}) {
         EXPECT_EQ(probed_for(code, device), FS_EXT2);
     }
-    EXPECT_EQ(probed_for(FS_ERR, device), FS_NONE);
-    EXPECT_EQ(probed_for(static_cast<fs_code>(1000), device), FS_NONE);
+    device.write_at(3, "NTFS    ");
+    EXPECT_EQ(probed_for(FS_NTFS, device), FS_NTFS);
+    for (fs_code code : {FS_NONE, FS_ERR, static_cast<fs_code>(1000)}) {
+        EXPECT_EQ(probed_for(code, device), FS_NONE) << code;
+    }
 }
 
 TEST(FsProbe, the_order_decides_between_two_matches)

@@ -20,7 +20,6 @@
 
 using support::capture_stdout;
 using support::contains;
-using support::put_part;
 using support::put_root;
 
 namespace {

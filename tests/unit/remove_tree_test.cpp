@@ -9,6 +9,7 @@
 
 #include "support/capture.h"
 #include "support/files.h"
+#include "support/stubs.h"
 #include "support/text.h"
 
 using support::exists;
@@ -76,10 +77,13 @@ TEST_F(Remove, rm_rf_takes_a_path_of_any_length)
 
 TEST_F(Remove, rm_rf_whose_command_is_killed_gives_one)
 {
-    // The shell itself is killed: the path ends the quotes.
-    std::string path = ROOT + "/x\"; kill -KILL $$; \"";
+    // The shell is killed, also one that gives its process to its only command.
+    support::stub_programs stubs;
+    stubs.add("rm", R"x([ "$(cat /proc/$PPID/comm)" = sh ] && kill -KILL $PPID || kill -KILL $$)x");
+    std::string path = ROOT + "/x";
     support::capture_stderr([&] {
         std::string log = log_of([&] { EXPECT_EQ(path_rm_rf(path.c_str()), 1); });
+        EXPECT_EQ(stubs.calls().size(), 1U);
         std::string last = support::lines_of(log).back();
         EXPECT_EQ(last.substr(0, 24), "ERROR[remove_tree.cpp:N]") << log;
         EXPECT_TRUE(support::contains(last, ")rm err, fn = " + path)) << log;

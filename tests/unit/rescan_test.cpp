@@ -4,7 +4,9 @@
 
 #include <cstdint>
 #include <cstdio>
+#include <filesystem>
 #include <string>
+#include <vector>
 
 #include "disk/discovery.h"
 #include "disk/disk_sets.h"

@@ -413,8 +413,9 @@ TEST_F(Uci, a_path_of_127_characters_is_taken_and_a_longer_one_never_cut)
         EXPECT_EQ(uci2_set_by_name(ctx, "firewall", "webdav_wan", longer.c_str(), "long"), -1);
     });
     EXPECT_STREQ(out, "");
-    EXPECT_EQ(count_of(log, "ERROR[config_path.cpp:N]uci path too long, path = firewall.webdav_wan.ooo"),
-              2);
+    EXPECT_EQ(
+        count_of(log, "ERROR[config_path.cpp:N]uci path too long, path = firewall.webdav_wan.ooo"),
+        2);
     EXPECT_EQ(got(("firewall.webdav_wan." + option).c_str()), "short");
 
     const std::string by_index(127 - strlen("firewall.@zone[1]."), 'o');

@@ -56,7 +56,7 @@ process_view look_at_process()
         const std::string target = fs::read_symlink(link, gone);
         // The look's own descriptor is closed by now.
         if (!gone) {
-            view.descriptors.insert(link + " -> " + target);
+            view.descriptors.insert(std::string(link).append(" -> ").append(target));
         }
     }
     view.directory = fs::current_path();
