@@ -2,6 +2,8 @@
 
 #include <sys/stat.h>
 
+#include <cerrno>
+
 #include "util/block_dev.h"
 #include "util/file.h"
 #include "util/paths.h"
@@ -37,7 +39,7 @@ bool is_system_disk(const char* root_dev)
     for (int walk = 0; walk < DIR_WALKS; ++walk) {
         dir_stream dir(path);
         if (dir.stream == nullptr) {
-            return false;
+            return errno != ENOENT;
         }
         while (const char* name = dir.next_name()) {
             if (dev_name_is_disk(name) == MATCHES && is_system_device(name)) {

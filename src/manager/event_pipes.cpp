@@ -292,7 +292,7 @@ int event_parse_dev_name(const char* message, char* out, int32_t max)
     }
     const char* name = colon + 1;
     const size_t length = strlen(name);
-    if (length > static_cast<size_t>(max)) {
+    if (max < 0 || length > static_cast<size_t>(max)) {
         log_err("err event(%s), disk name long\n", message);
         return 1;
     }

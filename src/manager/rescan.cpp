@@ -79,6 +79,12 @@ bool is_new(const block_slot& found)
     return known == nullptr || (found.node_id != 0 && found.node_id != known->node_id);
 }
 
+// A partition's name begins with its disk's.
+bool is_of_one_disk(const char* a, const char* b)
+{
+    return text_has_prefix(a, b) || text_has_prefix(b, a);
+}
+
 bool offer_again(disk_sets* disks)
 {
     const bool any = offered_again.count > 0;
@@ -129,6 +135,18 @@ void rescan_offer_again(const char* dev_name)
     if (offered_again.count < OFFERS_MAX) {
         text_copy(offered_again.dev_names[offered_again.count++], dev_name);
     }
+}
+
+void rescan_drop_offers(const char* dev_name)
+{
+    int kept = 0;
+    for (int i = 0; i < offered_again.count; ++i) {
+        const char* offered = offered_again.dev_names[i];
+        if (dev_name != nullptr && !is_of_one_disk(offered, dev_name)) {
+            text_copy(offered_again.dev_names[kept++], offered);
+        }
+    }
+    offered_again.count = kept;
 }
 
 void rescan_reset()

@@ -12,5 +12,9 @@
 // Has the next call offer the disk or partition to the inventory as if it came then.
 void rescan_offer_again(const char* dev_name);
 
+// Drops such offers of the device, its disk and its partitions, since its removal is meant; of all
+// devices for a null name.
+void rescan_drop_offers(const char* dev_name);
+
 // Forgets the previous call. For tests.
 void rescan_reset();

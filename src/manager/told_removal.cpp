@@ -16,8 +16,8 @@ void remove_bracketed(disk_sets* sets, const char* name, int (*remove)(disk_sets
     services_stop();
     const waiting_disks waiting = find_waiting_disks(sets, name);
     remove(sets, name);
-    bring_back_waiting_disks(sets, waiting);
     services_start();
+    bring_back_waiting_disks(sets, waiting);
 }
 
 }  // namespace
@@ -29,12 +29,16 @@ void remove_told_dev(disk_sets* sets, const char* dev_name, bool from_hotplug)
     if (may_be_late) {
         log_warn("removal of a former disk, dev = %s\n", dev_name);
         rescan_offer_again(dev_name);
+    } else if (!from_hotplug) {
+        rescan_drop_offers(dev_name);
     }
 }
 
 void remove_told_dir(disk_sets* sets, const char* dir_name)
 {
     remove_bracketed(sets, dir_name, remove_disk);
+    // Nobody knows any more which device that was.
+    rescan_drop_offers(nullptr);
 }
 
 void remove_told_all(disk_sets* sets)
@@ -43,5 +47,6 @@ void remove_told_all(disk_sets* sets)
     safe_remove_all(sets);
     // That goes through what the kernel lists; nobody looks for the others while parked.
     forget_pulled_disks(sets);
+    rescan_drop_offers(nullptr);
     services_start();
 }

@@ -103,6 +103,32 @@ TEST_F(ToldRemoval, whoever_asks_for_a_removal_gets_it_even_then)
     EXPECT_FALSE(has("sda2"));
 }
 
+TEST_F(ToldRemoval, a_removal_that_is_meant_lasts_although_a_late_message_came_before)
+{
+    for (const char* meant : {"sda", "sda1"}) {
+        remove_told_dev(&sets, "sda1", true);
+        remove_told_dev(&sets, meant, false);
+        rescan();
+        EXPECT_FALSE(has("sda1")) << meant;
+        disk_sets_add_dev(&sets, "sda");
+        disk_sets_add_dev(&sets, "sda1");
+        disk_sets_add_dev(&sets, "sda2");
+        mount_all(&sets);
+    }
+    remove_told_dev(&sets, "sda1", true);
+    remove_told_all(&sets);
+    rescan();
+    EXPECT_EQ(disk_sets_count(&sets), 0);
+}
+
+TEST_F(ToldRemoval, a_removal_of_another_disk_drops_no_offer)
+{
+    remove_told_dev(&sets, "sda1", true);
+    remove_told_dev(&sets, "sdb", false);
+    rescan();
+    EXPECT_TRUE(has("sda1"));
+}
+
 TEST_F(ToldRemoval, a_device_that_is_gone_by_then_does_not_come_back)
 {
     remove_told_dev(&sets, "sda1", true);

@@ -34,7 +34,7 @@ class Mount:
 
 @dataclass(frozen=True)
 class StatusPart:
-    """One published partition, with the disk's flag beside its own seven values."""
+    """One published partition, with the disk's flag beside its own first seven values."""
 
     dev_name: str
     disk_name: str
@@ -58,7 +58,9 @@ def parse_mounts(text):
 
 def parse_parts(document):
     """Flat list of the partitions of a parsed disk.json."""
-    return [StatusPart(sd_card=disk["sd_card"], **part)
+    return [StatusPart(sd_card=disk["sd_card"],
+                       **{key: value for key, value in part.items()
+                          if key in StatusPart.__dataclass_fields__})
             for disk in document["disk"] for part in disk.get("part", [])]
 
 
