@@ -12,6 +12,8 @@ null = os.open("/dev/null", os.O_WRONLY)
 out = os.dup(1)
 os.dup2(null, 1)
 os.dup2(null, 2)
+# The first command of a fresh process pays for what a running daemon has paid long ago.
+os.system("true")
 begun = time.monotonic()
 for command in commands:
     os.system(command)

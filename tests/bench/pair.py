@@ -136,6 +136,8 @@ class Pair:
         raise TimeoutError(f"{sorted(expected)} were not published:\n{self.world.diagnosis()}")
 
     def _with_floor(self, total, log, silence, used):
+        # What the daemon still does in that cycle would slow its own floor down.
+        self.world.wait(self.daemon.waits_for_events, 30, "the end of the daemon's cycle")
         commands = replay(self.twin, announced(log))
         return Sample(total, silence + self.waits.of_mounts(log), commands, used)
 
