@@ -192,8 +192,9 @@ def test_late_messages_about_a_pull_cost_the_disk_that_has_the_name_now_a_moment
     disk, _, daemon = two_disks(world, start_daemon)
     messages = world.pull(disk)
     world.plug(disk, "sda")
-    daemon.wait_log("disk was replaced, dev = sda", 20)
-    daemon.wait_log("dev ok, dev = /dev/sda", 20, daemon.mark())
+    world.wait(lambda: "dev ok, dev = /dev/sda\n"
+               in daemon.log().partition("disk was replaced, dev = sda")[2], 30,
+               "the new disk of the name")
     world.send(*messages)
     daemon.wait_log("removal of a former disk, dev = sda1", 20)
     wait_mounted(world, {"sda1": "disk1_part1", "sdb": "disk2_part1"})
