@@ -3,11 +3,14 @@
 import tempfile
 
 from selenium import webdriver
+from selenium.common.exceptions import StaleElementReferenceException
 from selenium.webdriver.chrome.service import Service
 from selenium.webdriver.common.by import By
 
 from world import CHECKOUT, wait_for
 
+# More often than this the page does not change while one element is looked for.
+CHANGES = 5
 RESULTS = CHECKOUT / "build/test-results"
 _OPTIONS = ("--headless=new", "--no-sandbox", "--disable-gpu", "--disable-dev-shm-usage", "--no-first-run",
             "--disable-background-networking", "--disable-component-update", "--hide-scrollbars")
@@ -41,11 +44,13 @@ class Browser:
 
     def text(self, selector="#view"):
         """Visible text of the first element, empty when there is none."""
-        found = self.all(selector)
-        return found[0].text if found else ""
+        def read():
+            found = self.all(selector)
+            return found[0].text if found else ""
+        return _while_the_page_changes(read)
 
     def click(self, selector):
-        self.all(selector)[0].click()
+        _while_the_page_changes(lambda: self.all(selector)[0].click())
 
     def run(self, script, *arguments):
         """Run a script in the page; returns what it returns."""
@@ -79,3 +84,13 @@ class Browser:
     def complaints(self):
         """What the page complained of since the last call."""
         return [entry["message"] for entry in self.driver.get_log("browser") if entry["level"] == "SEVERE"]
+
+
+def _while_the_page_changes(action):
+    """The action's result; the page may replace an element between finding and using it."""
+    for _ in range(CHANGES - 1):
+        try:
+            return action()
+        except StaleElementReferenceException:
+            continue
+    return action()
