@@ -120,10 +120,15 @@ class Router:
         return pid if self.world.run("readlink", f"/proc/{pid}/exe", check=False).stdout else None
 
     def pids(self):
-        """Pids of the daemon, as the router sees them."""
-        script = (f'for exe in /proc/[0-9]*/exe; do [ "$(readlink $exe)" = {PROG} ] && echo $exe; done')
-        listed = self.world.sh(script, check=False).stdout.split()
-        return [int(path.split("/")[2]) for path in listed]
+        """Pids of the daemon, as the router sees them.
+
+        A child carries its program until it has become the command that it was made for.
+        """
+        script = (f'for exe in /proc/[0-9]*/exe; do [ "$(readlink $exe)" = {PROG} ] && '
+                  'sed -n "s/^PPid:[[:space:]]*//p" ${exe%exe}status && echo $exe; done')
+        lines = self.world.sh(script, check=False).stdout.split()
+        parents = {int(path.split("/")[2]): int(parent) for parent, path in zip(lines[::2], lines[1::2])}
+        return [pid for pid, parent in parents.items() if parent not in parents]
 
     def open_files(self, pid):
         """Targets of a process's descriptors."""
