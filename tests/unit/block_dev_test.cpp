@@ -14,6 +14,7 @@
 #include "support/capture.h"
 #include "support/files.h"
 #include "support/images.h"
+#include "support/listing.h"
 #include "support/stubs.h"
 #include "support/text.h"
 
@@ -240,6 +241,46 @@ TEST_F(SysBlock, the_parent_is_cut_to_its_buffer)
     filled out;
     log_of([&] { EXPECT_EQ(sys_block_find_parent("mmcblk0p1", out.bytes, 4), 0); });
     EXPECT_EQ(out.text(4), "mmc");
+}
+
+TEST_F(SysBlock, the_parent_is_looked_for_anew_when_the_list_of_disks_breaks_off_twice)
+{
+    make_dir("/sys/block/sda/sda1");
+    make_dir("/sys/block/sdb/sdb1");
+    const std::string disk = support::last_listed("/sys/block");
+    const support::broken_listing broken("/sys/block", disk, 2);
+    filled out;
+    const std::string log =
+        log_of([&] { EXPECT_EQ(sys_block_find_parent((disk + "1").c_str(), out.bytes, 32), 0); });
+    EXPECT_EQ(out.text(32), disk);
+    EXPECT_EQ(support::count_of(log, "read dir err\n"), 2) << log;
+}
+
+TEST_F(SysBlock, a_list_of_disks_that_breaks_off_a_third_time_gives_no_parent)
+{
+    make_dir("/sys/block/sda/sda1");
+    make_dir("/sys/block/sdb/sdb1");
+    const std::string disk = support::last_listed("/sys/block");
+    const support::broken_listing broken("/sys/block", disk, 100);
+    filled out;
+    const std::string log =
+        log_of([&] { EXPECT_EQ(sys_block_find_parent((disk + "1").c_str(), out.bytes, 32), 1); });
+    EXPECT_EQ(out.first(32), std::string(32, '#')) << "and no name";
+    EXPECT_EQ(broken.left(), 100 - 3);
+    EXPECT_EQ(support::count_of(log, "read dir err\n"), 3) << log;
+}
+
+TEST_F(SysBlock, a_partition_is_not_overlooked_when_the_list_of_partitions_breaks_off)
+{
+    make_dir("/sys/block/sda/sda1");
+    make_dir("/sys/block/sda/sda2");
+    const std::string part = support::last_listed("/sys/block/sda");
+    const support::broken_listing broken("/sys/block/sda", part, 2);
+    filled out;
+    const std::string log =
+        log_of([&] { EXPECT_EQ(sys_block_find_parent(part.c_str(), out.bytes, 32), 0); });
+    EXPECT_EQ(out.text(32), "sda");
+    EXPECT_EQ(support::count_of(log, "read dir err\n"), 2) << log;
 }
 
 TEST_F(SysBlock, the_sectors_are_the_number_in_the_size_file)

@@ -14,6 +14,7 @@
 #include "support/clock.h"
 #include "support/disk_world.h"
 #include "support/files.h"
+#include "support/listing.h"
 #include "support/records.h"
 #include "support/text.h"
 #include "util/fs_code.h"
@@ -294,6 +295,35 @@ TEST_F(Removal, the_safe_removal_fails_when_the_kernels_list_cannot_be_read)
         EXPECT_EQ(disk_sets_count(&sets), 1);
     });
     EXPECT_TRUE(contains(log, "]open dir err, dir = /sys/block\n")) << log;
+}
+
+TEST_F(Removal, the_safe_removal_begins_anew_when_the_kernels_list_breaks_off_twice)
+{
+    put_mounted_disk(0, "sda", {0});
+    put_mounted_disk(1, "sdb", {0});
+    plug_disk("sda", "", 1);
+    plug_disk("sdb", "", 1);
+    const support::broken_listing broken("/sys/block", support::last_listed("/sys/block"), 2);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(safe_remove_all(&sets), 0); });
+    EXPECT_EQ(support::count_of(log, "read dir err\n"), 2) << log;
+    EXPECT_TRUE(is_all_zero(sets));
+    EXPECT_EQ(times_called("umount /dev/sda"), 1) << "one that is gone already is left alone";
+    EXPECT_EQ(times_called("umount /dev/sdb"), 1);
+}
+
+TEST_F(Removal, the_safe_removal_fails_when_the_kernels_list_breaks_off_a_third_time)
+{
+    put_mounted_disk(0, "sda", {0});
+    put_mounted_disk(1, "sdb", {0});
+    plug_disk("sda", "", 1);
+    plug_disk("sdb", "", 1);
+    const std::string last = support::last_listed("/sys/block");
+    const support::broken_listing broken("/sys/block", last, 3);
+    const std::string log = capture_stdout([&] { EXPECT_EQ(safe_remove_all(&sets), 1); });
+    EXPECT_EQ(support::count_of(log, "read dir err\n"), 3) << log;
+    EXPECT_EQ(disk_sets_count(&sets), 1) << "what was listed is removed";
+    EXPECT_NE(disk_sets_find_disk(&sets, last.c_str()), nullptr) << "what was not reached stays";
+    EXPECT_EQ(stored_mountd(("U-" + last + "1").c_str()), 1);
 }
 
 TEST_F(Removal, a_null_table_is_answered_with_1)
