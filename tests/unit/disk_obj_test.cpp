@@ -61,6 +61,26 @@ TEST_F(DiskObj, a_partition_of_999_mib_is_dropped_and_one_of_1000_mib_is_kept)
     EXPECT_FALSE(contains(log, "sda2"));
 }
 
+TEST_F(DiskObj, an_extended_partition_of_1000_mib_keeps_its_slot_when_small_ones_are_dropped)
+{
+    plug_disk("sda", "", 50000);
+    const std::string details = R"(PTTYPE="dos")";
+    plug_part("sda", "sda1", details, 999);
+    plug_part("sda", "sda2", details, 1000);
+    std::string sector(512, '\0');
+    sector[510] = '\x55';
+    sector[511] = '\xAA';
+    for (const char* name : {"sda1", "sda2"}) {
+        support::write_file(std::string("/dev/") + name, sector + std::string(200000, '\0'));
+        ASSERT_EQ(disk_obj_add_sub_part(disk, name), 0);
+    }
+    ASSERT_EQ(disk->parts[1].part.fs_type, FS_EXTENDED);
+    disk_obj_read_sizes(disk);
+    disk_obj_drop_small_parts(disk);
+    EXPECT_EQ(slots(), "- sda2 - - - - - -") << "the small one goes like any other";
+    EXPECT_EQ(disk->parts[1].part.fs_type, FS_EXTENDED);
+}
+
 TEST_F(DiskObj, the_whole_disk_is_never_dropped_as_small)
 {
     disk->root.total_len = 10;
@@ -127,6 +147,26 @@ TEST_F(DiskObj, a_new_partition_takes_the_first_free_slot_and_points_to_its_root
     EXPECT_STREQ(disk->parts[1].part.uid, "U-2");
     EXPECT_TRUE(contains(log, "=== ===> add sub part ==> /dev/sda2\n"));
     EXPECT_TRUE(contains(log, "=== ===> part dev name = sda2, ref root dev = sda\n"));
+}
+
+TEST_F(DiskObj, behind_several_slots_that_fell_free_a_new_partition_takes_the_first_after_sorting)
+{
+    const uint64_t sizes[MAX_SUB_PARTS] = {2000, 500, 4000, 3000, 999, 1000, 0, 5000};
+    for (int i = 0; i < MAX_SUB_PARTS; ++i) {
+        put_part(disk, i, ("sda" + std::to_string(i + 1)).c_str(), sizes[i]);
+    }
+    disk_obj_drop_small_parts(disk);
+    disk_obj_clear_part(disk, &disk->parts[3].part);
+    ASSERT_EQ(slots(), "sda1 - sda3 - - sda6 - sda8");
+    disk_obj_sort_parts_by_size(disk);
+    EXPECT_EQ(slots(), "sda8 sda3 sda1 sda6 - - - -");
+    plug_part("sda", "sda9", R"(UUID="U-9" TYPE="ext4")", 2000);
+    EXPECT_EQ(disk_obj_add_sub_part(disk, "sda9"), 0);
+    EXPECT_EQ(slots(), "sda8 sda3 sda1 sda6 sda9 - - -");
+    EXPECT_STREQ(disk->parts[4].part.uid, "U-9");
+    for (int i = 5; i < MAX_SUB_PARTS; ++i) {
+        EXPECT_TRUE(is_all_zero(disk->parts[i])) << i;
+    }
 }
 
 TEST_F(DiskObj, setting_the_root_makes_it_point_to_itself)
