@@ -5,9 +5,11 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <functional>
 #include <string>
 
 #include "support/capture.h"
+#include "support/child.h"
 #include "support/files.h"
 #include "support/stubs.h"
 #include "support/text.h"
@@ -40,6 +42,22 @@ protected:
 using Remove = Trees;
 using PathGetType = Trees;
 using PathRemoveTree = Trees;
+
+// Runs action in a child that owns the trees and is no superuser, for whom every directory is open;
+// it begins above them. Returns the log.
+std::string expect_as_nobody(const std::function<void()>& action)
+{
+    constexpr uid_t NOBODY = 65534;
+    for (const auto& entry : std::filesystem::recursive_directory_iterator(ROOT)) {
+        EXPECT_EQ(lchown(entry.path().c_str(), NOBODY, NOBODY), 0);
+    }
+    EXPECT_EQ(lchown(ROOT.c_str(), NOBODY, NOBODY), 0);
+    return support::without_line_numbers(support::expect_in_child([&] {
+        ASSERT_EQ(chdir(ROOT.c_str()), 0);
+        ASSERT_EQ(setuid(NOBODY), 0);
+        action();
+    }));
+}
 
 }  // namespace
 
@@ -241,6 +259,39 @@ TEST_F(PathRemoveTree, a_relative_path_of_two_names_leaves_its_empty_directory)
     log_of([] { EXPECT_EQ(path_remove_tree("tree/deep"), 0); });
     EXPECT_EQ(std::filesystem::current_path(), ROOT + "/tree");
     EXPECT_TRUE(std::filesystem::is_empty(ROOT + "/tree/deep"));
+}
+
+TEST_F(PathRemoveTree, a_directory_that_cannot_be_listed_or_entered_stays_and_gives_one)
+{
+    for (const mode_t mode : {0333, 0444}) {
+        write_file(ROOT + "/tree/file", "x");
+        ASSERT_EQ(chmod((ROOT + "/tree").c_str(), mode), 0);
+        const std::string log = expect_as_nobody([] {
+            EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 1);
+            EXPECT_EQ(std::filesystem::current_path(), ROOT) << "the working directory stays";
+        });
+        EXPECT_EQ(log, "ERROR[remove_tree.cpp:N](Permission denied)ope dir err, path = "
+                       "/run/trees/tree\n")
+            << mode;
+        EXPECT_TRUE(exists(ROOT + "/tree/file")) << mode;
+    }
+}
+
+TEST_F(PathRemoveTree, a_directory_inside_that_cannot_be_entered_stays_with_those_above_it_alone)
+{
+    write_file(ROOT + "/tree/one", "x");
+    write_file(ROOT + "/tree/closed/file", "x");
+    write_file(ROOT + "/tree/deep/two", "x");
+    ASSERT_EQ(chmod((ROOT + "/tree/closed").c_str(), 0444), 0);
+    const std::string log = expect_as_nobody([] {
+        EXPECT_EQ(path_remove_tree((ROOT + "/tree").c_str()), 0);
+        EXPECT_EQ(std::filesystem::current_path(), ROOT) << "the parent of what was to be removed";
+    });
+    EXPECT_EQ(log, "ERROR[remove_tree.cpp:N](Permission denied)ope dir err, path = closed\n"
+                   "ERROR[remove_tree.cpp:N](Directory not empty)rm err, fn = /run/trees/tree\n");
+    EXPECT_TRUE(exists(ROOT + "/tree/closed/file"));
+    EXPECT_FALSE(exists(ROOT + "/tree/one"));
+    EXPECT_FALSE(exists(ROOT + "/tree/deep"));
 }
 
 TEST_F(PathRemoveTree, what_is_neither_file_link_nor_directory_is_refused)
