@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -324,6 +325,24 @@ TEST_F(LogFile, is_named_after_the_time_without_leading_zeros)
     ASSERT_EQ(files.size(), 1U);
     EXPECT_TRUE(files[0] == dated_log_path(before) || files[0] == dated_log_path(after))
         << files[0];
+}
+
+TEST_F(LogFile, is_for_all_to_read_and_for_its_owner_to_write_less_the_umask)
+{
+    support::make_dir("/tmp/log");
+    const mode_t old_mask = umask(0);
+    for (const mode_t mask : {0U, 077U}) {
+        umask(mask);
+        ASSERT_EQ(log_file_open(), 0);
+        log_file_close();
+        log_reset();
+        ASSERT_EQ(log_files().size(), 1U);
+        struct stat info {};
+        ASSERT_EQ(stat(log_files()[0].c_str(), &info), 0);
+        EXPECT_EQ(info.st_mode, S_IFREG | (0644U & ~mask));
+        support::remove_all(log_files()[0]);
+    }
+    umask(old_mask);
 }
 
 TEST_F(LogFile, a_link_under_its_name_is_not_followed)

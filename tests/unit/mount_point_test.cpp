@@ -233,6 +233,24 @@ TEST_F(MountPoint, a_device_that_cannot_be_looked_at_is_not_taken_for_gone)
     support::remove_all("/dev/sdb");
 }
 
+TEST_F(MountPoint, a_mount_listing_that_cannot_be_read_is_nothing_to_complain_of)
+{
+    // Both faults are there; but a "yes" from either would cost the database.
+    add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");
+    add_mount("/dev/sdb1", "/tmp/mountd/disk1_part1");
+    capture_stdout([] {
+        ASSERT_EQ(check_mount_path_dup(), 1);
+        ASSERT_EQ(check_mount_dev_exist(), 1);
+    });
+    stubs.add("mount", "rm -f /tmp/mount.txt");
+    for (int (*const check)() : {check_mount_path_dup, check_mount_dev_exist}) {
+        const std::string log = capture_stdout([&] { EXPECT_EQ(check(), 0); });
+        EXPECT_TRUE(contains(log, "]err, fn = /tmp/mount.txt\n")) << log;
+        EXPECT_FALSE(contains(log, "=== check mount path err\n"))
+            << "nothing is looked at: " << log;
+    }
+}
+
 TEST_F(MountPoint, the_forced_unmount_names_each_device_and_then_its_path)
 {
     add_mount("/dev/sda1", "/tmp/mountd/disk1_part1");

@@ -177,6 +177,18 @@ TEST_F(PartInfo, an_empty_answer_of_the_label_script_is_replaced_by_the_device_n
     EXPECT_STREQ(fill(R"(LABEL="Music" TYPE="ext4")").label, "sda1");
 }
 
+TEST_F(PartInfo, what_a_killed_label_script_has_said_is_no_label_and_blkids_is_taken)
+{
+    // The shell is killed, also one that gives its process to its only command.
+    stubs.add_at("/usr/bin/disk_get_label.sh",
+                 "echo 'My Mu'\n"
+                 R"x([ "$(cat /proc/$PPID/comm)" = sh ] && kill -KILL $PPID || kill -KILL $$)x");
+    support::capture_stderr(
+        [&] { EXPECT_STREQ(fill(R"(LABEL="Their Music" TYPE="ext4")").label, "Their"); });
+    EXPECT_EQ(times_called("/usr/bin/disk_get_label.sh sda1"), 1);
+    EXPECT_EQ(times_called("blkid -d /dev/sda1"), 1);
+}
+
 TEST_F(PartInfo, a_uuid_and_a_label_of_128_characters_and_more_stay_terminated)
 {
     const std::string text(200, 'u');
