@@ -1,5 +1,6 @@
 """The feed package: what its Makefile installs, depends on and tells CMake."""
 
+import json
 import os
 import re
 import subprocess
@@ -109,6 +110,18 @@ def test_a_question_of_the_menu_chooses_the_prompt_build(buildroot):
     assert "config TARN_NAS_DISKMANAGER_PROMPT\n" in (FEED_DIR / "Config.in").read_text()
     for setting, waits in (((), "steady"), (("CONFIG_TARN_NAS_DISKMANAGER_PROMPT=y",), "prompt")):
         assert f"-DDISKMANAGER_WAITS={waits}" in buildroot.show(PACKAGE, *setting)["CMAKE_OPTIONS"].split()
+
+
+@pytest.mark.parametrize("given, waits", [((), "steady"), (("-DDISKMANAGER_WAITS=prompt",), "prompt")])
+def test_whoever_builds_without_naming_the_waits_gets_the_steady_ones(tmp_path, given, waits):
+    # A preset and the package's Makefile name what they want; a plain call of CMake does not.
+    subprocess.run(["cmake", "-S", CHECKOUT, "-B", tmp_path, "-DDISKMANAGER_UNIT_TESTS=OFF", *given],
+                   check=True, capture_output=True)
+    commands = json.loads((tmp_path / "compile_commands.json").read_text())
+    own = [entry["command"] for entry in commands if "/src/" in entry["file"]]
+    assert own
+    assert {word for command in own for word in command.split() if "DISKMANAGER_WAITS" in word} == {
+        f"-DDISKMANAGER_WAITS={waits}"}
 
 
 def test_cmake_knows_each_option_that_it_is_given(buildroot):
