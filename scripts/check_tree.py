@@ -1,6 +1,6 @@
 #!/usr/bin/env python3
-"""Judges what no compiler sees: which folder may include which, how long files are, that documents, versions and paths
-agree with the source. Prints a line for each finding; ends with 1 when there was one."""
+"""Judges what no compiler sees: which folder may include which, how long files are, that documents, versions, paths and
+the package's menu agree with the source. Prints a line for each finding; ends with 1 when there was one."""
 
 import pathlib
 import re
@@ -20,6 +20,10 @@ PATH_MAKERS = {"util/paths.h", "util/paths.cpp", "log/log.cpp"}
 
 LOG_INDEX = ROOT / "docs" / "log.md"
 FROZEN_INDEX = ROOT / "docs" / "frozen.md"
+FILESYSTEMS = SRC / "util" / "fs_code.h"
+PACKAGE = ROOT / "openwrt" / "tarn-nas-diskmanager"
+# Filesystems that the driver of another one mounts.
+ALSO_DRIVES = {"ext2": "ext4", "ext3": "ext4"}
 LITERAL = r'"((?:[^"\\]|\\.)*)"'
 
 
@@ -156,8 +160,38 @@ def check_versions():
         yield "the version differs: " + ", ".join(f"{name} has {version}" for name, version in found.items())
 
 
+def mount_commands():
+    """Name and mount command of each filesystem in the daemon's table that has one."""
+    table = re.search(r"\bFILESYSTEMS\[\] = \{(.*?)\n\};", FILESYSTEMS.read_text(), re.DOTALL).group(1)
+    return re.findall(r'"([^"]+)",\s*(?:"[^"]*"|NO_TEXT),\s*"(mount[^"]*)"', table)
+
+
+def package_that_mounts(command):
+    """What OpenWrt calls the package of the kernel's driver, or of the program that mounts in its place."""
+    program, *words = command.split()
+    if program != "mount":
+        return program.removeprefix("mount.")
+    driver = words[words.index("-t") + 1]
+    return "kmod-fs-" + ALSO_DRIVES.get(driver, driver)
+
+
+def check_filesystem_switches():
+    makefile = (PACKAGE / "Makefile").read_text()
+    menu = (PACKAGE / "Config.in").read_text()
+    commands = mount_commands()
+    if not commands:
+        yield f"{FILESYSTEMS.relative_to(ROOT)}: no filesystem with a mount command is found"
+    for name, command in commands:
+        package = package_that_mounts(command)
+        switch = re.search(rf"\+(\w+):{re.escape(package)}(?=\s)", makefile)
+        if not switch:
+            yield f"{PACKAGE.relative_to(ROOT)}/Makefile: {name} needs +SWITCH:{package} among the dependencies"
+        elif not re.search(rf"^config {switch[1]}$", menu, re.MULTILINE):
+            yield f"{PACKAGE.relative_to(ROOT)}/Config.in: {name} needs a switch, config {switch[1]}"
+
+
 CHECKS = [check_directions, check_cycles, check_lengths, check_paths, check_log_index, check_frozen_names,
-          check_versions]
+          check_versions, check_filesystem_switches]
 
 
 def main():
