@@ -50,17 +50,6 @@ void log_root_fs(const disk_obj* disk)
     log_info("root part fs = %s\n", fs_type_name(disk->root.fs_type));
 }
 
-// An earlier walk that broke off may have taken the partition in.
-bool has_slot(const disk_obj* disk, const char* dev_name)
-{
-    for (const part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal(slot.part.dev_name, dev_name) == MATCHES) {
-            return true;
-        }
-    }
-    return false;
-}
-
 // True, which is logged, when the disk is none for users.
 bool is_kept_out(const char* root_dev)
 {
@@ -192,7 +181,8 @@ void disk_obj_scan_parts(disk_obj* disk)
             return;
         }
         while (const char* name = dir.next_name()) {
-            if (dev_name_is_disk(name) == MATCHES && !has_slot(disk, name)) {
+            // An earlier walk that broke off may have taken the partition in.
+            if (dev_name_is_disk(name) == MATCHES && !disk_obj_holds(disk, name)) {
                 disk_obj_add_sub_part(disk, name);
             }
         }

@@ -127,21 +127,37 @@ int disk_obj_has_dev(const disk_obj* disk, const char* dev_name)
 {
     if (disk == nullptr) {
         log_err("err!\n");
-        return 1;
+        return NO_MATCH;
     }
     log_info("check dev, name = %s\n", dev_name);
     log_info("root part dev = %s\n", disk->root.dev_name);
     if (str_equal_nullsafe(disk->root.dev_name, dev_name) == MATCHES) {
         log_warn("root dev already exist, name = %s\n", dev_name);
-        return 0;
+        return MATCHES;
     }
     for (const part_slot& slot : disk->parts) {
         if (slot.in_use == 1 && str_equal_nullsafe(slot.part.dev_name, dev_name) == MATCHES) {
             log_warn("dev already exist, name = %s\n", dev_name);
-            return 0;
+            return MATCHES;
         }
     }
-    return 1;
+    return NO_MATCH;
+}
+
+bool disk_obj_holds(const disk_obj* disk, const char* dev_name)
+{
+    if (disk == nullptr || dev_name == nullptr) {
+        return false;
+    }
+    if (str_equal(disk->root.dev_name, dev_name) == MATCHES) {
+        return true;
+    }
+    for (const part_slot& slot : disk->parts) {
+        if (slot.in_use == 1 && str_equal(slot.part.dev_name, dev_name) == MATCHES) {
+            return true;
+        }
+    }
+    return false;
 }
 
 int disk_obj_clear_part(disk_obj* disk, const part_info* part)

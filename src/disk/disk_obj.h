@@ -35,8 +35,11 @@ part_info* disk_obj_get_part(disk_obj* disk, const char* dev_name);
 // The in-use slot of that directory name, null when none.
 part_info* disk_obj_find_part_by_disk_name(disk_obj* disk, const char* dir_name);
 
-// 0 when the root or a slot has that device name, 1 when none has.
+// MATCHES when the root or a slot has that device name, NO_MATCH when none has.
 int disk_obj_has_dev(const disk_obj* disk, const char* dev_name);
+
+// The same, and the log is told nothing.
+[[nodiscard]] bool disk_obj_holds(const disk_obj* disk, const char* dev_name);
 
 // Frees the slot that has the part's device name.
 int disk_obj_clear_part(disk_obj* disk, const part_info* part);

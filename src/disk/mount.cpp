@@ -44,12 +44,15 @@ void make_mount_dir(const char* mount_path)
     }
 }
 
-void run_mount(const char* format, const char* dev_path, const char* mount_path)
+// False when there is no such command and nothing to wait for.
+bool run_mount(const char* format, const char* dev_path, const char* mount_path)
 {
     char command[COMMAND_SIZE];
-    if (command_format(command, format, {dev_path, mount_path})) {
-        exec_cmd(command, 1);
+    if (!command_format(command, format, {dev_path, mount_path})) {
+        return false;
     }
+    exec_cmd(command, 1);
+    return true;
 }
 
 // A userspace filesystem takes its time to appear in the mount table.
@@ -245,8 +248,7 @@ void mount_part(part_info* part)
     }
     log_info("mout path = %s\n", part->mount_path);
     make_mount_dir(part->mount_path);
-    run_mount(format, dev_path, part->mount_path);
-    if (!wait_until_mounted(dev_path)) {
+    if (!run_mount(format, dev_path, part->mount_path) || !wait_until_mounted(dev_path)) {
         log_warn("=== === === mount ERROR, %s ==> %s\n", dev_path, part->mount_path);
         return;
     }

@@ -152,17 +152,17 @@ void number_sub_parts(disk_obj* disk)
 int check_part_mounted(part_info* part)
 {
     if (part == nullptr) {
-        return 1;
+        return YES;
     }
     char dev_path[PATH_SIZE];
     path_dev_node(dev_path, part->dev_name);
     if (get_dev_mount_path(dev_path, part->mount_path) != YES) {
-        return 0;
+        return NO;
     }
     log_warn("already mounted, dev = %s\n", dev_path);
     mount_path_to_name(part->mount_path, part->disk_name, sizeof(part->disk_name));
     log_info("get disk name = %s\n", part->disk_name);
-    return 1;
+    return YES;
 }
 
 int check_disks_mounted(disk_sets* sets)
@@ -184,7 +184,7 @@ int check_mount_path_dup()
 {
     mount_table table;
     if (!read_for_check(&table)) {
-        return 0;
+        return NO;
     }
     for (int i = 0; i < table.num; ++i) {
         for (int j = 0; j < table.num; ++j) {
@@ -196,17 +196,17 @@ int check_mount_path_dup()
             log_info("mount path err:\n");
             log_mount(a);
             log_mount(b);
-            return 1;
+            return YES;
         }
     }
-    return 0;
+    return NO;
 }
 
 int check_mount_dev_exist()
 {
     mount_table table;
     if (!read_for_check(&table)) {
-        return 0;
+        return NO;
     }
     for (int i = 0; i < table.num; ++i) {
         const char* dev_path = table.entries[i].dev;
@@ -214,10 +214,10 @@ int check_mount_dev_exist()
         // One that cannot be looked at must not cost the database.
         if (path_is_gone(dev_path)) {
             log_warn("dev not find, dev = %s\n", dev_path);
-            return 1;
+            return YES;
         }
     }
-    return 0;
+    return NO;
 }
 
 void umount_all_force()

@@ -18,16 +18,16 @@ int set_all_mount_point_num(disk_sets* sets);
 // and is part 1 itself.
 void number_sub_parts(disk_obj* disk);
 
-// 1 when the part's device is mounted already (its mount_path and disk_name then follow), else 0.
+// YES when the part's device is mounted already (its mount_path and disk_name then follow), or NO.
 int check_part_mounted(part_info* part);
 
 // Marks every part of every disk that is mounted already. Always 0, 1 for a null table.
 int check_disks_mounted(disk_sets* sets);
 
-// 1 when two mounted devices share one mount path, else 0.
+// YES when two mounted devices share one mount path, or NO.
 int check_mount_path_dup();
 
-// 1 when the node of a mounted device is gone, else 0.
+// YES when the node of a mounted device is gone, or NO.
 int check_mount_dev_exist();
 
 // Force-unmounts, by device and by path, everything that is mounted below the mount base.

@@ -130,32 +130,32 @@ int is_path_mounted(const char* path)
 {
     if (path == nullptr) {
         log_err("err!\n");
-        return 1;
+        return YES;
     }
     mount_table table;
     if (read_mount_table(&table) != 0) {
-        return 0;
+        return NO;
     }
-    return find_mount_by_path(&table, path) >= 0 ? 1 : 0;
+    return find_mount_by_path(&table, path) >= 0 ? YES : NO;
 }
 
 int get_dev_mount_path(const char* dev_path, char* out)
 {
     if (dev_path == nullptr) {
         log_err("err!\n");
-        return 1;
+        return YES;
     }
     mount_table table;
     if (read_mount_table(&table) != 0) {
-        return 0;
+        return NO;
     }
-    int mounted = 0;
+    int mounted = NO;
     for (int i = 0; i < table.num; ++i) {
         const mount_entry* entry = &table.entries[i];
         if (str_equal(entry->dev, dev_path) != MATCHES) {
             continue;
         }
-        mounted = 1;
+        mounted = YES;
         if (out != nullptr) {
             text_copy({out, MOUNT_PATH_SIZE}, entry->path);
         }

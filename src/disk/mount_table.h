@@ -37,8 +37,8 @@ void parse_mount_point_num(const char* path, int32_t* main_number, int32_t* sub_
 int find_mount_by_dev(const mount_table* table, const char* dev_path);
 int find_mount_by_path(const mount_table* table, const char* path);
 
-// Each takes a fresh snapshot. 1 for yes, 0 for no; a null argument counts as mounted, so that
-// nothing is ever mounted over an unknown state.
+// Each takes a fresh snapshot. YES or NO; a null argument counts as mounted, so that nothing
+// is ever mounted over an unknown state.
 int is_dev_mounted(const char* dev_path);
 int is_path_mounted(const char* path);
 

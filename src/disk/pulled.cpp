@@ -135,24 +135,11 @@ bool any_disk_lacks_a_node(const disk_sets* sets)
     return false;
 }
 
-bool holds_dev(const disk_obj* disk, const char* dev_name)
-{
-    if (str_equal(disk->root.dev_name, dev_name) == MATCHES) {
-        return true;
-    }
-    for (const part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal(slot.part.dev_name, dev_name) == MATCHES) {
-            return true;
-        }
-    }
-    return false;
-}
-
 // The place of the disk that holds the device, -1 when none does. Tells the log nothing.
 int find_owner(const disk_sets* sets, const char* dev_name)
 {
     for (int i = 0; i < MAX_DISKS; ++i) {
-        if (sets->entries[i].in_use == 1 && holds_dev(&sets->entries[i].disk, dev_name)) {
+        if (sets->entries[i].in_use == 1 && disk_obj_holds(&sets->entries[i].disk, dev_name)) {
             return i;
         }
     }

@@ -6,19 +6,6 @@
 
 namespace {
 
-bool holds_dev(const disk_obj* disk, const char* dev_name)
-{
-    if (str_equal(disk->root.dev_name, dev_name) == MATCHES) {
-        return true;
-    }
-    for (const part_slot& slot : disk->parts) {
-        if (slot.in_use == 1 && str_equal(slot.part.dev_name, dev_name) == MATCHES) {
-            return true;
-        }
-    }
-    return false;
-}
-
 bool awaits_mount_pass(const disk_obj* disk)
 {
     bool has_part = false;
@@ -51,7 +38,7 @@ waiting_disks find_waiting_disks(const disk_sets* sets, const char* removed_dev)
     }
     for (const disk_entry& entry : sets->entries) {
         const disk_obj* disk = &entry.disk;
-        if (entry.in_use == 1 && awaits_mount_pass(disk) && !holds_dev(disk, removed_dev)) {
+        if (entry.in_use == 1 && awaits_mount_pass(disk) && !disk_obj_holds(disk, removed_dev)) {
             text_copy(found.root_devs[found.count++], disk->root.dev_name);
         }
     }

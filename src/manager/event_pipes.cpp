@@ -15,6 +15,7 @@
 #include "util/paths.h"
 #include "util/pause.h"
 #include "util/text.h"
+#include "util/waits.h"
 
 namespace {
 
@@ -102,11 +103,9 @@ void prepare_sets(event_pipes* pipes)
         FD_SET(fd, &pipes->except_set);
         pipes->max_fd = largest(pipes->max_fd, fd);
     }
-    pipes->timeout = {EVENT_WAIT_SECONDS, 0};
-    if (pipes->wait_ms > 0) {
-        pipes->timeout = {pipes->wait_ms / MS_PER_SECOND,
-                          static_cast<suseconds_t>(pipes->wait_ms % MS_PER_SECOND) * US_PER_MS};
-    }
+    const int32_t wait_ms = pipes->wait_ms > 0 ? pipes->wait_ms : WAITS.idle;
+    pipes->timeout = {wait_ms / MS_PER_SECOND,
+                      static_cast<suseconds_t>(wait_ms % MS_PER_SECOND) * US_PER_MS};
 }
 
 // Reads one message byte by byte. A line without its terminator is lost: its writer broke off.

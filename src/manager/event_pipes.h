@@ -22,7 +22,6 @@ enum event_code : int32_t {
 
 constexpr int32_t EVENT_NAME_SIZE = 32;
 constexpr uint32_t EVENT_LINE_SIZE = 256;
-constexpr int EVENT_WAIT_SECONDS = 3;
 
 struct disk_event {
     event_code type;                 // EVENT_NONE when there is none
@@ -39,7 +38,7 @@ struct event_pipes {
     int32_t max_fd;
     disk_event event;  // the last parsed event
     int32_t event_fd;  // the pipe that its message came from
-    int32_t wait_ms;   // how long the next cycle waits; 0 for EVENT_WAIT_SECONDS
+    int32_t wait_ms;   // how long the next cycle waits; 0 for the idle wait
 };
 
 // What event_receive answers when there is an event.

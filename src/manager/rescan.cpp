@@ -104,8 +104,8 @@ bool rescan_block_devices(disk_sets* disks, int32_t* changed)
         return false;
     }
     bool any = false;
-    // Empty slots are compared like names on purpose: when a full list shrinks, "" is offered once,
-    // and no device is called that.
+    // Empty slots are compared like names on purpose: when a full list shrinks, "" is offered once
+    // for each, and no device is called that.
     for (const block_slot& slot : found.slots) {
         if (is_new(slot)) {
             // An old record would make the inventory refuse the new disk of its name.

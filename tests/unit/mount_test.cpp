@@ -175,6 +175,17 @@ TEST_F(Mount, an_unknown_filesystem_stays_unmounted_and_gets_no_directory)
     EXPECT_FALSE(std::filesystem::exists("/tmp/mountd/disk1_part1"));
 }
 
+TEST_F(Mount, a_device_that_no_command_may_name_is_given_up_at_once)
+{
+    part_info* part = put_ready_part(0, 1, "U-1");
+    text_copy(part->dev_name, "sda1;x");
+    const std::string log = capture_stdout([&] { mount_part(part); });
+    EXPECT_EQ(part->mount_status, 0);
+    EXPECT_EQ(support::the_clock.slept_ms, 0);
+    EXPECT_TRUE(contains(log, "]=== === === mount ERROR, /dev/sda1;x ==> "));
+    EXPECT_FALSE(contains(log, "exec cmd = mount -t"));
+}
+
 TEST_F(Mount, a_mount_that_never_appears_is_given_up_after_18_seconds)
 {
     support::write_file(support::MOUNT_REFUSES, "");
