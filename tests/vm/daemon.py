@@ -27,6 +27,8 @@ STARTED = ["samba4 start", "nas_samba3 start", "tarn_nas_sys_dl start", "tarn_na
 
 # Every mount is looked for in steps of two seconds and every wait for an event takes up to three.
 SETTLE_LIMIT = 60
+# Each look starts programs in an emulated machine, and the daemon needs its processor too.
+LOOK_EVERY = 1
 
 
 def pack_daemon(archive):
@@ -133,7 +135,7 @@ class Daemon:
             if time.monotonic() > end:
                 raise VmError(f"expected {expected}, published {self.places()}, mounted {self.mounts()}")
 
-            time.sleep(0.2)
+            time.sleep(LOOK_EVERY)
 
     def _signal_listening(self, signal):
         self.vm.wait(f"pid=$(cat {PID_FILE}) && grep -q select /proc/$pid/wchan && kill -{signal} $pid")
