@@ -1,6 +1,7 @@
 #include "manager/rescan.h"
 
 #include <cstddef>
+#include <cstring>
 
 #include "disk/discovery.h"
 #include "disk/pulled.h"
@@ -14,6 +15,8 @@ namespace {
 
 constexpr int BLOCK_LIST_SIZE = 16;
 constexpr size_t BLOCK_NAME_SIZE = 16;
+constexpr char DIGITS[] = "0123456789";
+constexpr char SCSI_PREFIX[] = "sd";
 
 struct block_slot {
     char name[BLOCK_NAME_SIZE];
@@ -79,10 +82,20 @@ bool is_new(const block_slot& found)
     return known == nullptr || (found.node_id != 0 && found.node_id != known->node_id);
 }
 
-// A partition's name begins with its disk's.
+// How much of a device name is its disk's: sda of sda1, mmcblk0 of mmcblk0p1.
+size_t root_length(const char* dev_name)
+{
+    const size_t letters = strcspn(dev_name, DIGITS);
+    if (text_has_prefix(dev_name, SCSI_PREFIX)) {
+        return letters;
+    }
+    return letters + strspn(dev_name + letters, DIGITS);
+}
+
 bool is_of_one_disk(const char* a, const char* b)
 {
-    return text_has_prefix(a, b) || text_has_prefix(b, a);
+    const size_t length = root_length(a);
+    return length == root_length(b) && strncmp(a, b, length) == 0;
 }
 
 bool offer_again(disk_sets* disks)

@@ -12,8 +12,8 @@
 // Has the next call offer the disk or partition to the inventory as if it came then.
 void rescan_offer_again(const char* dev_name);
 
-// Drops such offers of the device, its disk and its partitions, since its removal is meant; of all
-// devices for a null name.
+// Drops such offers of the disk that the device is or is on, since its removal is meant: to take in
+// one partition would take in all of a disk that is forgotten. Of all disks for a null name.
 void rescan_drop_offers(const char* dev_name);
 
 // Forgets the previous call. For tests.

@@ -6,6 +6,7 @@
 #include "log/log.h"
 #include "manager/rescan.h"
 #include "manager/services.h"
+#include "util/text.h"
 
 namespace {
 
@@ -18,6 +19,17 @@ void remove_bracketed(disk_sets* sets, const char* name, int (*remove)(disk_sets
     remove(sets, name);
     services_start();
     bring_back_waiting_disks(sets, waiting);
+}
+
+// The device that has the directory, null when nobody knows.
+const char* find_dev_of_dir(disk_sets* sets, const char* dir_name)
+{
+    for (disk_entry& entry : sets->entries) {
+        if (const part_info* part = disk_obj_find_part_by_disk_name(&entry.disk, dir_name)) {
+            return part->dev_name;
+        }
+    }
+    return nullptr;
 }
 
 }  // namespace
@@ -36,9 +48,15 @@ void remove_told_dev(disk_sets* sets, const char* dev_name, bool from_hotplug)
 
 void remove_told_dir(disk_sets* sets, const char* dir_name)
 {
+    // The record is cleared by the removal, and with it the name in it.
+    char dev_name[PART_DEV_NAME_SIZE]{};
+    const char* owner = find_dev_of_dir(sets, dir_name);
+    if (owner != nullptr) {
+        text_copy(dev_name, owner);
+    }
     remove_bracketed(sets, dir_name, remove_disk);
-    // Nobody knows any more which device that was.
-    rescan_drop_offers(nullptr);
+    // A directory that nobody knows may be that of a device which is to be offered again.
+    rescan_drop_offers(owner != nullptr ? dev_name : nullptr);
 }
 
 void remove_told_all(disk_sets* sets)

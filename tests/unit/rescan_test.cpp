@@ -252,3 +252,29 @@ TEST_F(Rescan, a_disk_that_vanished_unannounced_is_removed_with_all_its_partitio
     EXPECT_TRUE(support::is_all_zero(sets));
     EXPECT_EQ(times_called("umount /dev/sda1"), 1);
 }
+
+TEST_F(Rescan, a_meant_removal_drops_the_offers_of_its_own_disk_alone)
+{
+    struct meant_case {
+        const char* offered;
+        const char* meant;
+        bool dropped;
+    };
+    for (const meant_case& one : {meant_case{"sda1", "sda1", true},
+                                  {"sda1", "sda2", true},
+                                  {"sda1", "sda", true},
+                                  {"sda", "sda10", true},
+                                  {"mmcblk0p1", "mmcblk0", true},
+                                  {"mmcblk0p1", "mmcblk0p2", true},
+                                  {"sda1", "sdaa1", false},
+                                  {"sda1", "sd", false},
+                                  {"sda1", "", false},
+                                  {"mmcblk1p1", "mmcblk10p1", false},
+                                  {"sda1", nullptr, true}}) {
+        rescan_reset();
+        rescan_offer_again(one.offered);
+        rescan_drop_offers(one.meant);
+        // An offer that is left makes a change of its own, whatever becomes of it.
+        EXPECT_EQ(rescan(), one.dropped ? 0 : 1) << one.offered << ", " << (one.meant ? one.meant : "null");
+    }
+}

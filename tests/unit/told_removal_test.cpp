@@ -22,6 +22,9 @@ using support::contains;
 namespace {
 
 constexpr time_t NOW = 1'000'000;
+// Larger than what is free in the directories of this world, which are not really mounted.
+constexpr int DISK_MIB = 900'000;
+constexpr int PART_MIB = 400'000;
 
 class ToldRemoval : public support::disk_world {
 protected:
@@ -43,9 +46,9 @@ protected:
 
     void plug()
     {
-        plug_disk("sda", R"(PTTYPE="dos")", 9000);
+        plug_disk("sda", R"(PTTYPE="dos")", DISK_MIB);
         for (const char* part : {"sda1", "sda2"}) {
-            plug_part("sda", part, std::string("UUID=\"U-") + part + R"(" TYPE="ext4")", 4000);
+            plug_part("sda", part, std::string("UUID=\"U-") + part + R"(" TYPE="ext4")", PART_MIB);
         }
     }
 
@@ -97,7 +100,8 @@ TEST_F(ToldRemoval, it_is_taken_in_again_once)
 TEST_F(ToldRemoval, whoever_asks_for_a_removal_gets_it_even_then)
 {
     remove_told_dev(&sets, "sda1", false);
-    remove_told_dir(&sets, sets.entries[0].disk.parts[1].part.disk_name);
+    ASSERT_TRUE(has("sda2"));
+    remove_told_dir(&sets, disk_sets_find_part(&sets, "sda2")->disk_name);
     rescan();
     EXPECT_FALSE(has("sda1"));
     EXPECT_FALSE(has("sda2"));
@@ -129,6 +133,38 @@ TEST_F(ToldRemoval, a_removal_of_another_disk_drops_no_offer)
     EXPECT_TRUE(has("sda1"));
 }
 
+TEST_F(ToldRemoval, a_removal_by_another_devices_directory_drops_no_offer)
+{
+    plug_disk("sdb", R"(PTTYPE="dos")", DISK_MIB);
+    plug_part("sdb", "sdb1", R"(UUID="U-3" TYPE="ext4")", PART_MIB);
+    disk_sets_add_dev(&sets, "sdb");
+    mount_all(&sets);
+    remove_told_dev(&sets, "sda1", true);
+    ASSERT_TRUE(has("sdb1"));
+    remove_told_dir(&sets, disk_sets_find_part(&sets, "sdb1")->disk_name);
+    EXPECT_FALSE(has("sdb1"));
+    rescan();
+    EXPECT_TRUE(has("sda1"));
+}
+
+TEST_F(ToldRemoval, a_removal_by_directory_lasts_although_the_disks_other_partition_is_offered)
+{
+    remove_told_dev(&sets, "sda1", true);
+    ASSERT_TRUE(has("sda2"));
+    remove_told_dir(&sets, disk_sets_find_part(&sets, "sda2")->disk_name);
+    rescan();
+    EXPECT_FALSE(has("sda2"));
+}
+
+TEST_F(ToldRemoval, a_directory_that_nobody_knows_may_be_that_of_an_offered_device)
+{
+    const std::string directory = disk_sets_find_part(&sets, "sda1")->disk_name;
+    remove_told_dev(&sets, "sda1", true);
+    remove_told_dir(&sets, directory.c_str());
+    rescan();
+    EXPECT_FALSE(has("sda1"));
+}
+
 TEST_F(ToldRemoval, a_device_that_is_gone_by_then_does_not_come_back)
 {
     remove_told_dev(&sets, "sda1", true);
@@ -154,7 +190,7 @@ TEST_F(ToldRemoval, a_disk_that_waits_for_its_first_mount_pass_outlives_the_remo
 {
     for (const bool by_directory : {false, true}) {
         plug_disk("sdb", R"(PTTYPE="dos")", 5000);
-        plug_part("sdb", "sdb1", R"(UUID="U-B" TYPE="ext4")", 4000);
+        plug_part("sdb", "sdb1", R"(UUID="U-B" TYPE="ext4")", PART_MIB);
         disk_sets_add_dev(&sets, "sdb");
         if (by_directory) {
             remove_told_dir(&sets, sets.entries[0].disk.parts[1].part.disk_name);
