@@ -39,7 +39,7 @@ bool is_system_disk(const char* root_dev)
     for (int walk = 0; walk < DIR_WALKS; ++walk) {
         dir_stream dir(path);
         if (dir.stream == nullptr) {
-            return errno != ENOENT;
+            return errno != ENOENT && errno != ENOTDIR;
         }
         while (const char* name = dir.next_name()) {
             if (dev_name_is_disk(name) == MATCHES && is_system_device(name)) {

@@ -111,3 +111,10 @@ TEST_F(SystemDisk, other_disks_are_added_beside_it)
     EXPECT_EQ(disk_sets_count(&sets), 1);
     EXPECT_STREQ(sets.entries[0].disk.root.dev_name, "sdb");
 }
+
+TEST_F(SystemDisk, a_disk_whose_directory_is_none_is_nobodys)
+{
+    support::remove_all("/sys/block/sda");
+    support::write_file("/sys/block/sda", "");
+    EXPECT_FALSE(is_system_disk("sda"));
+}
