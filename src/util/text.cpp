@@ -7,7 +7,7 @@
 
 void text_copy(std::span<char> out, const char* text)
 {
-    text_copy_n(out, text, strlen(text));
+    text_copy_n(out, text != nullptr ? text : "", out.size());
 }
 
 void text_copy_n(std::span<char> out, const char* text, size_t count)

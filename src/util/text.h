@@ -7,7 +7,7 @@
 #include "util/answer.h"
 
 // Copies text into out and zero-fills the rest; cut at one character less than out, always
-// terminated. An out of no bytes is left alone.
+// terminated. Null counts as empty. An out of no bytes is left alone.
 void text_copy(std::span<char> out, const char* text);
 
 // Copies at most count characters of text the same way.

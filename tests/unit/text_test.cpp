@@ -46,6 +46,14 @@ TEST(TextCopy, cuts_at_one_less_than_the_size)
     }
 }
 
+TEST(TextCopy, takes_null_for_an_empty_text)
+{
+    dirty_buffer out;
+    text_copy({out.bytes, 16}, nullptr);
+    EXPECT_TRUE(out.zero_between(0, 16));
+    EXPECT_TRUE(out.untouched_from(16));
+}
+
 TEST(TextCopy, zero_fills_the_rest)
 {
     dirty_buffer out;
