@@ -48,6 +48,6 @@ void disk_sets_dump(const disk_sets* sets);
 int disk_sets_sort_by_size(disk_sets* sets);
 
 // Frees the entries of disks that hold neither a valid partition nor a filesystem of their own. A
-// disk that waits for its first mount pass has no valid partition either: "A new disk can be
-// forgotten" in docs/limits.md.
+// disk that waits for its first mount pass has no valid partition either: whoever removes another
+// one sees to it that it comes back (disk/waiting.h).
 int disk_sets_clear_empty(disk_sets* sets);

@@ -104,8 +104,8 @@ bool publish(const char* path, const char* text)
 
 void disk_sets_publish(disk_sets* sets)
 {
-    // A disk that waits for its first mount pass counts as empty and goes too: docs/limits.md,
-    // "Coming and going".
+    // A disk that waits for its first mount pass would count as empty and go too: nobody publishes
+    // before that.
     disk_sets_clear_empty(sets);
     disk_status_write_json(sets);
     disk_status_write_count(sets);
