@@ -353,9 +353,11 @@ return view.extend({
 		var self = this;
 
 		names.forEach(function(name) { self.removed[name] = true; });
-		this.done = names;
-		this.showEnd('success', names.length > 1 ? _('You can unplug them now.') : _('You can unplug it now.'));
-		return this.look();
+		/* The rows behind it say so, too. */
+		return this.look().then(function() {
+			self.done = names;
+			self.showEnd('success', names.length > 1 ? _('You can unplug them now.') : _('You can unplug it now.'));
+		});
 	},
 
 	showBusy: function() {
