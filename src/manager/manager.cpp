@@ -10,8 +10,8 @@
 #include "log/log.h"
 #include "manager/rescan.h"
 #include "manager/self_check.h"
+#include "manager/start_scan.h"
 #include "manager/told_removal.h"
-#include "util/block_dev.h"
 #include "util/file.h"
 #include "util/paths.h"
 #include "util/pause.h"
@@ -40,38 +40,6 @@ constexpr time_t REFRESH_AFTER_SECONDS = 4;
 constexpr time_t UPDATE_EVERY_SECONDS = 3;
 constexpr time_t PUBLISH_AFTER_SECONDS = 29;
 constexpr time_t RESCAN_EVERY_SECONDS = 8;
-
-enum scan_result {
-    SCAN_FAILED,  // the kernel's list cannot be opened
-    SCAN_NO_DISK,
-    SCAN_HAS_DISK,
-};
-
-// Adds every disk that the kernel lists.
-scan_result add_all_disks(disk_sets* disks)
-{
-    dir_stream dir(SYS_BLOCK);
-    if (dir.stream == nullptr) {
-        log_err("open dir err, dir = %s\n", SYS_BLOCK);
-        return SCAN_FAILED;
-    }
-    log_info("scan path = %s\n", SYS_BLOCK);
-    bool have_disk = false;
-    while (const char* name = dir.next_name()) {
-        log_info("d_name = %s\n", name);
-        if (dev_name_is_disk(name) == MATCHES) {
-            disk_sets_add_dev(disks, name);
-            have_disk = true;
-        }
-    }
-    // Who knows what comes behind the place where reading broke off. The rescans, which wait for a
-    // first disk, shall find it.
-    if (dir.failed) {
-        have_disk = true;
-    }
-    log_info("have disk = %d\n", have_disk ? 1 : 0);
-    return have_disk ? SCAN_HAS_DISK : SCAN_NO_DISK;
-}
 
 // False when no event came for too long and the companion process is gone: docs/limits.md, "It ends
 // when nobody needs it".
