@@ -1,9 +1,13 @@
 """Slow disks and busy ones: however the daemon waits for them, the same comes of it."""
 
+import re
+from collections import Counter
+
 import pytest
 from shared.waits import BOTH_PROGRAMS, PROMPT_PROGRAM, is_prompt
 
 from world import Partition
+from world.state import DISK_JSON
 
 pytestmark = pytest.mark.needs_fs("ext4")
 
@@ -98,13 +102,29 @@ exec {router.tools.real("umount")} "$@"
     assert [row["mountd"] for row in router.db_rows()] == ["no"]
 
 
+def uptime(router):
+    return float(router.sh("read -r uptime idle < /proc/uptime; echo $uptime").stdout)
+
+
+@pytest.mark.takes_minutes
 def test_a_calm_daemon_does_as_much_in_both_builds(router):
     router.hotplug(router.disk, "sda")
     expect_mounted_and_published(router)
     router.daemon.wait_rescan()
-    router.daemon.wait_idle_cycles(2)
-    mark = router.daemon.mark()
-    begun = float(router.sh("read -r uptime idle < /proc/uptime; echo $uptime").stdout)
-    router.daemon.wait_idle_cycles(4)
-    took = float(router.sh("read -r uptime idle < /proc/uptime; echo $uptime").stdout) - begun
-    assert router.daemon.log_since(mark).count("no event ...") <= took / 3 + 1
+    # From 30 s after the last change on, the status files are written in each cycle.
+    router.daemon.wait_idle_cycles(11)
+    mark, begun, written = router.daemon.mark(), uptime(router), set()
+
+    def six_cycles():
+        written.add(router.path(DISK_JSON).stat().st_mtime_ns)
+        return router.daemon.log_since(mark).count("no event ...") >= 6
+    router.wait(six_cycles, PATIENCE, "six idle cycles")
+    took, log = uptime(router) - begun, router.daemon.log_since(mark)
+
+    assert log.count("no event ...") <= took / 3 + 1
+    # Two looks at the mount table in each check, which comes every 9 s, and one for the companion in a minute.
+    commands = Counter(re.findall(r"exec cmd = (\S+)", log))
+    assert set(commands) <= {"mount", "pidof"}
+    assert 0 < commands["mount"] <= 2 * (took / 9 + 1)
+    assert commands["pidof"] <= 1
+    assert 3 <= len(written) <= took / 3 + 2
