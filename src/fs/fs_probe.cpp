@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <iterator>
 
 #include "log/log.h"
 
@@ -199,6 +200,11 @@ constexpr bool each_probe_finds_filesystems()
     return true;
 }
 static_assert(each_probe_finds_filesystems(), "what a probe finds is in the table of filesystems");
+
+static_assert(probe_of(FS_EXTENDED) == std::end(PROBES) - 3 &&
+                  probe_of(FS_EFI) == std::end(PROBES) - 2 &&
+                  probe_of(FS_MBR) == std::end(PROBES) - 1,
+              "filesystems stand in front of EXTENDED and MBR, which take any signed sector");
 
 }  // namespace
 

@@ -23,7 +23,7 @@ enum fs_code : int32_t {
 struct filesystem {
     fs_code code;
     const char* name;        // on display: log lines and the status file print it as it stands
-    const char* blkid_type;  // up to four characters, with which blkid's TYPE begins
+    const char* blkid_type;  // blkid's TYPE: its first four characters, or all of a shorter one
     const char* mount;       // the command to mount it: device node, directory
     const char* repair;      // the command to repair it: device node
 };
