@@ -109,8 +109,8 @@ const expectation EXPECTED[] = {
      {{{1024 + 0x38, MAGIC}, {1024 + 0x5C, JOURNAL_AND_EXTENTS}}}},
 };
 
-// blkid's word for it says too little, and nobody has a checker.
-bool may_lack_texts(const std::string& name)
+// blkid's word for it does not tell a journal. A repair command is whatever EXPECTED says.
+bool may_lack_blkid_type(const std::string& name)
 {
     return name == "HFSPLUS";
 }
@@ -179,7 +179,7 @@ std::string lacks(const filesystem& row)
     }
     const expectation& wanted = EXPECTED[place];
     const bool mounted = is_mounted(row.code);
-    const bool complete = mounted && !may_lack_texts(wanted.name);
+    const bool in_blkid = mounted && !may_lack_blkid_type(wanted.name);
     const bool detected = row.code != FS_NONE && row.code != FS_ERR;
     const struct {
         const char* what;
@@ -191,15 +191,15 @@ std::string lacks(const filesystem& row)
          filled_in(text_of(row.mount), {"/dev/sda1", "/tmp/mountd/d"}) == wanted.mount &&
              wanted.mount.empty() != mounted},
         {"its repair command", filled_in(text_of(row.repair), {"/dev/sda1"}) == wanted.repair &&
-                                   (!complete || !wanted.repair.empty())},
-        {"blkid's word", complete == !wanted.blkid_type.empty() &&
-                             (!complete || named_by_blkid(wanted.blkid_type) == row.code)},
+                                   (mounted || wanted.repair.empty())},
+        {"blkid's word", in_blkid == !wanted.blkid_type.empty() &&
+                             (!in_blkid || named_by_blkid(wanted.blkid_type) == row.code)},
         {"a probe for its superblock", !detected || probed(wanted) == row.code},
         {"its name in docs/disk.schema.json",
          stands_in("docs/disk.schema.json", "\"" + wanted.name + "\"")},
         {"its row in docs/interfaces.md",
          !mounted || stands_in("docs/interfaces.md", wanted.document)},
-        {"its package",
+        {"its package in openwrt/tarn-nas-diskmanager/Makefile",
          !mounted || stands_in("openwrt/tarn-nas-diskmanager/Makefile", wanted.package)},
     };
     std::string missing;
