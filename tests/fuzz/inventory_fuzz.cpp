@@ -1,5 +1,6 @@
 // An inventory of arbitrary records through the writer of the status files. The document must be
-// JSON to the letter and hold exactly what the records say, byte by byte.
+// JSON to the letter and hold exactly what the records say, byte by byte. Fields of a partition
+// behind those known here are taken as they are.
 //
 // Fields: bytes that say which records are there and choose their numbers and texts, then the
 // texts.
@@ -67,6 +68,10 @@ struct chooser {
     }
 };
 
+// Among the expected tokens: here further fields of a partition may stand, which nothing is known
+// of but that each is a text or a number.
+constexpr char FURTHER_FIELDS = '+';
+
 struct document {
     json_tokens tokens;
 
@@ -96,6 +101,7 @@ struct document {
         add_text("label", part.label[0] != '\0' ? part.label : part.dev_name);
         add_number("total_len", part.total_len);
         add_number("free_size", part.free_size);
+        tokens.add(FURTHER_FIELDS);
         tokens.add('}');
     }
 
@@ -199,16 +205,39 @@ void require_number(const std::string& number, const std::string& promised)
     require(std::fabs(read - wanted) <= wanted * 1e-15, "a large number keeps its digits");
 }
 
+// The place of the first printed token that belongs to no further field.
+size_t behind_fields(size_t at)
+{
+    while (printed.kinds[at] == 's') {
+        require(printed.kinds[at + 1] == 's' || printed.kinds[at + 1] == 'n',
+                "a further field of a partition is a text or a number");
+        at += 2;
+    }
+    return at;
+}
+
+void require_token(size_t at, size_t promised)
+{
+    require(printed.kinds[at] == expected.tokens.kinds[promised],
+            "every record is published in the right form");
+    if (printed.text(at) == expected.tokens.text(promised)) {
+        return;
+    }
+    require(printed.kinds[at] == 'n', "a text is published byte by byte");
+    require_number(std::string(printed.text(at)), std::string(expected.tokens.text(promised)));
+}
+
 void require_as_promised()
 {
-    require(printed.kinds == expected.tokens.kinds, "every record is published in the right form");
-    for (size_t i = 0; i < printed.kinds.size(); ++i) {
-        if (printed.text(i) == expected.tokens.text(i)) {
-            continue;
+    size_t at = 0;
+    for (size_t i = 0; i < expected.tokens.kinds.size(); ++i) {
+        if (expected.tokens.kinds[i] == FURTHER_FIELDS) {
+            at = behind_fields(at);
+        } else {
+            require_token(at++, i);
         }
-        require(printed.kinds[i] == 'n', "a text is published byte by byte");
-        require_number(std::string(printed.text(i)), std::string(expected.tokens.text(i)));
     }
+    require(at == printed.kinds.size(), "nothing else is published");
 }
 
 void check_files(size_t disk_count)
