@@ -111,12 +111,35 @@ TEST_F(DiskStatus, a_published_partition_carries_what_schema_and_documentation_s
     }
     EXPECT_EQ(keys(part), required) << "the schema's list, in its order";
     EXPECT_EQ(keys(field(definition, "properties")), required) << "the schema's descriptions";
+}
+
+TEST_F(DiskStatus, each_partition_of_the_documented_example_has_the_keys_of_a_published_one)
+{
+    put_root(&sets.entries[0], "sda", 5000);
+    put_mounted(0, 0, "sda1", "disk1_part1");
+    disk_sets_publish(&sets);
+    const json_document root = published();
+    const cJSON* disk = cJSON_GetArrayItem(array(root.get(), "disk"), 0);
+    const std::string wanted = keys(cJSON_GetArrayItem(array(disk, "part"), 0));
+
     const std::string documentation = read_file(std::string(CHECKOUT) + "/docs/interfaces.md");
-    cJSON_ArrayForEach(key, part)
+    const size_t begin = documentation.find("\n    {\n", documentation.find("\n## Status files\n"));
+    ASSERT_NE(begin, std::string::npos);
+    // The parser stops behind the example.
+    const json_document example(cJSON_Parse(documentation.c_str() + begin), cJSON_Delete);
+    ASSERT_NE(example, nullptr) << "the example is no JSON";
+    int parts = 0;
+    cJSON_ArrayForEach(disk, array(example.get(), "disk"))
     {
-        const std::string quoted = std::string("\"") + key->string + "\":";
-        EXPECT_TRUE(contains(documentation, quoted)) << quoted << " in docs/interfaces.md";
+        const cJSON* part = nullptr;
+        cJSON_ArrayForEach(part, array(disk, "part"))
+        {
+            EXPECT_EQ(keys(part), wanted)
+                << string(part, "dev_name") << " in the example of docs/interfaces.md";
+            ++parts;
+        }
     }
+    EXPECT_GT(parts, 0);
 }
 
 TEST_F(DiskStatus, a_published_partition_begins_with_its_seven_first_keys_in_order)
