@@ -275,6 +275,7 @@ TEST_F(Rescan, a_meant_removal_drops_the_offers_of_its_own_disk_alone)
         rescan_offer_again(one.offered);
         rescan_drop_offers(one.meant);
         // An offer that is left makes a change of its own, whatever becomes of it.
-        EXPECT_EQ(rescan(), one.dropped ? 0 : 1) << one.offered << ", " << (one.meant ? one.meant : "null");
+        EXPECT_EQ(rescan(), one.dropped ? 0 : 1)
+            << one.offered << ", " << (one.meant != nullptr ? one.meant : "null");
     }
 }
