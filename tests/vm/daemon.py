@@ -25,8 +25,9 @@ PIPE = PIPES["add_remove"]
 STOPPED = ["samba4 stop", "nas_samba3 stop", "tarn_nas_sys_dl stop", "tarn_nas_sys_up stop"]
 STARTED = ["samba4 start", "nas_samba3 start", "tarn_nas_sys_dl start", "tarn_nas_sys_up start"]
 
-# Every mount is looked for in steps of two seconds and every wait for an event takes up to three.
-SETTLE_LIMIT = 60
+# Every mount is looked for in steps of two seconds and every wait for an event takes up to three: eight mounts take a
+# minute in an emulated machine that shares its processor with others.
+SETTLE_LIMIT = 240
 # Each look starts programs in an emulated machine, and the daemon needs its processor too.
 LOOK_EVERY = 1
 

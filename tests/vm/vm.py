@@ -20,8 +20,11 @@ BUILD = CHECKOUT / "build" / "vm"
 KERNEL = BUILD / "vmlinuz"
 INITRAMFS = BUILD / "initramfs.cpio"
 
-BOOT_LIMIT = 120
-PLUG_LIMIT = 15
+# Far beyond what each takes on a machine that does nothing else.
+BOOT_LIMIT = 300
+PLUG_LIMIT = 60
+MONITOR_LIMIT = 60
+COMMAND_LIMIT = 180
 
 
 class VmError(Exception):
@@ -75,14 +78,14 @@ class Monitor:
     def __init__(self, path):
         self.lines = LineSocket(path)
         self.events = []
-        json.loads(self.lines.receive(10))
+        json.loads(self.lines.receive(MONITOR_LIMIT))
         self.command("qmp_capabilities")
 
     def command(self, name, **arguments):
         self.lines.send(json.dumps({"execute": name, "arguments": arguments}))
 
         while True:
-            answer = json.loads(self.lines.receive(10))
+            answer = json.loads(self.lines.receive(MONITOR_LIMIT))
 
             if "event" in answer:
                 self.events.append(answer)
@@ -97,7 +100,7 @@ class Monitor:
                        for event in self.events)
 
         while not seen():
-            answer = json.loads(self.lines.receive(10))
+            answer = json.loads(self.lines.receive(MONITOR_LIMIT))
 
             if "event" in answer:
                 self.events.append(answer)
@@ -160,13 +163,13 @@ class Vm:
             self.process = None
             self.folder.cleanup()
 
-    def run(self, command, limit=60):
+    def run(self, command, limit=COMMAND_LIMIT):
         """Runs a shell script in the machine and returns its Result."""
         self.control.send(base64.b64encode(command.encode()).decode())
         status, _, output = self.control.receive(limit).partition(" ")
         return Result(int(status), base64.b64decode(output).decode(errors="replace"))
 
-    def check(self, command, limit=60):
+    def check(self, command, limit=COMMAND_LIMIT):
         """Runs a shell script that must succeed and returns what it printed."""
         result = self.run(command, limit)
 
