@@ -113,3 +113,15 @@ class Listener:
         with contextlib.suppress(ProcessLookupError):
             os.killpg(self._process.pid, 9)
         self._process.wait(10)
+        # What holds the pipe may end a moment after the process that brought it into the world.
+        wait_for(lambda: not self._is_there(), 10, "the listener's end")
+
+    def _is_there(self):
+        # A test may have put something else in its place.
+        if not self.pipe.is_fifo():
+            return False
+        try:
+            os.close(os.open(self.pipe, os.O_WRONLY | os.O_NONBLOCK))
+        except OSError:
+            return False
+        return True
