@@ -74,11 +74,17 @@ static void read_pipe(int fd)
 
 static void cycle(int fd)
 {
-    if (has_mode("busy"))
+    int waits = 1;
+
+    if (has_mode("busy")) {
         system("sleep 3");
+        /* Longer than the second between two signals, so that one of them meets it at rest. */
+        waits = 15;
+    }
     if (!has_mode("deaf"))
         read_pipe(fd);
-    usleep(100000);
+    while (waits-- > 0)
+        usleep(100000);
 }
 
 int main(void)
