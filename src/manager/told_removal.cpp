@@ -24,6 +24,9 @@ void remove_bracketed(disk_sets* sets, const char* name, int (*remove)(disk_sets
 // The device that has the directory, null when nobody knows.
 const char* find_dev_of_dir(disk_sets* sets, const char* dir_name)
 {
+    if (sets == nullptr) {
+        return nullptr;
+    }
     for (disk_entry& entry : sets->entries) {
         if (const part_info* part = disk_obj_find_part_by_disk_name(&entry.disk, dir_name)) {
             return part->dev_name;
@@ -49,14 +52,11 @@ void remove_told_dev(disk_sets* sets, const char* dev_name, bool from_hotplug)
 void remove_told_dir(disk_sets* sets, const char* dir_name)
 {
     // The record is cleared by the removal, and with it the name in it.
-    char dev_name[PART_DEV_NAME_SIZE]{};
-    const char* owner = find_dev_of_dir(sets, dir_name);
-    if (owner != nullptr) {
-        text_copy(dev_name, owner);
-    }
+    char dev_name[PART_DEV_NAME_SIZE];
+    text_copy(dev_name, find_dev_of_dir(sets, dir_name));
     remove_bracketed(sets, dir_name, remove_disk);
     // A directory that nobody knows may be that of a device which is to be offered again.
-    rescan_drop_offers(owner != nullptr ? dev_name : nullptr);
+    rescan_drop_offers(dev_name[0] != '\0' ? dev_name : nullptr);
 }
 
 void remove_told_all(disk_sets* sets)

@@ -165,6 +165,12 @@ TEST_F(ToldRemoval, a_directory_that_nobody_knows_may_be_that_of_an_offered_devi
     EXPECT_FALSE(has("sda1"));
 }
 
+TEST_F(ToldRemoval, a_directory_is_asked_for_without_a_table_too)
+{
+    remove_told_dir(nullptr, "disk1_part1");
+    EXPECT_TRUE(has("sda1"));
+}
+
 TEST_F(ToldRemoval, a_device_that_is_gone_by_then_does_not_come_back)
 {
     remove_told_dev(&sets, "sda1", true);
