@@ -4,7 +4,7 @@ import subprocess
 import time
 
 import pytest
-from openwrt.router import CONFIG, HELPERS
+from openwrt.router import CONFIG, HELPERS, INIT
 
 from world import CHECKOUT, Partition, wait_for
 from world.state import MOUNT_BASE
@@ -223,6 +223,20 @@ def test_a_partition_that_never_mounts_leaves_one_line(quick_router):
 def test_a_restart_by_the_self_check_is_told_with_its_reason(quick_router):
     old = quick_router.start()
     quick_router.world.sh(f"mkdir -p {MOUNT_BASE}/disk1_part1 &&"
+                          f" mount -t tmpfs /dev/sdz1 {MOUNT_BASE}/disk1_part1")
+    quick_router.uevent("add", "sda", "disk")
+    quick_router.wait_ready(but=[old])
+    assert texts(quick_router)[0] == "dev not find, dev = /dev/sdz1"
+
+
+def test_a_restart_gives_a_log_that_lags_behind_a_second_to_read_why(quick_router):
+    old = quick_router.start()
+    log = quick_router.instance_pid("log")
+    sleep = quick_router.world.tools.real("sleep")
+    # On a busy router the log comes to read again only while the init script waits.
+    quick_router.world.tools.stub("sleep", f"! grep -q {INIT} /proc/$PPID/cmdline || kill -CONT {log} 2>/dev/null\n"
+                                           f'exec {sleep} "$@"')
+    quick_router.world.sh(f"kill -STOP {log}; mkdir -p {MOUNT_BASE}/disk1_part1 &&"
                           f" mount -t tmpfs /dev/sdz1 {MOUNT_BASE}/disk1_part1")
     quick_router.uevent("add", "sda", "disk")
     quick_router.wait_ready(but=[old])
